@@ -1,0 +1,2 @@
+// Keeps an object library valid while its folder has no sources yet.
+namespace {}
