@@ -53,6 +53,10 @@ int XML1_Parse(XML1_Parser parser, const char* s, int len, int isFinal) {
     return XML_Parse(native(parser), s, len, isFinal) == XML_STATUS_OK ? XML1_STATUS_OK : XML1_STATUS_ERROR;
 }
 
+int XML1_StopParser(XML1_Parser parser) {
+    return XML_StopParser(native(parser), XML_FALSE) == XML_STATUS_OK ? 1 : 0;
+}
+
 int XML1_GetErrorCode(XML1_Parser parser) { return (int)XML_GetErrorCode(native(parser)); }
 
 // Expat answers null for codes it does not know; codes outside 0..63 are kept

@@ -50,6 +50,9 @@ void* XML1_GetBuffer(XML1_Parser parser, int len);
 int XML1_ParseBuffer(XML1_Parser parser, int len, int isFinal);
 // Parses `len` bytes at `s` (copied by the parser as needed).
 int XML1_Parse(XML1_Parser parser, const char* s, int len, int isFinal);
+// Called from a callback: ends the parse in progress, which then returns
+// XML1_STATUS_ERROR; no further callbacks are made. 1 on success.
+int XML1_StopParser(XML1_Parser parser);
 
 // The error of the last failed parse (XML1_ERROR_NONE when there is none),
 // its English text (null for an unknown code; static storage), and the
