@@ -201,7 +201,7 @@ private:
     int collectParmas();
     void removeTerm(size_t first, size_t last);
     int mainTable();
-    int routing(const TableRef& ref);
+    int routing(const TableRef& ref, const SQL1_DialTable* base);
     bool clauseEnd(size_t i) const;
     void typeMarkers();
     int insertColumns(std::vector<std::string>* columns, size_t* valuesOpen);
@@ -245,7 +245,8 @@ int Translator::resolveNames() {
         if (tok.deleted || (tok.kind != Tk::Ident && tok.kind != Tk::QIdent)) continue;
         std::string_view name = tok.text;
         if (tok.kind == Tk::QIdent) name = name.substr(1, name.size() - 2);
-        if (name.size() >= 5 && (ieq(name.substr(0, 5), "CSIT_") || (name.size() >= 7 && ieq(name.substr(0, 7), "sqlite_")))) {
+        auto prefixed = [&](std::string_view p) { return name.size() >= p.size() && ieq(name.substr(0, p.size()), p); };
+        if (prefixed("CSIT_") || prefixed("sqlite_") || prefixed("pragma_")) {
             return fail(SQL1_ST_DENIED, "name not accessible: " + std::string(name));
         }
         if (tok.kind != Tk::Ident || !isPunct(i + 1, ".") || at(i + 2).kind != Tk::Ident) continue;
@@ -356,6 +357,7 @@ bool Translator::clauseEnd(size_t i) const {
 int Translator::mainTable() {
     bool first = true;
     for (TableRef& ref : refs_) {
+        const SQL1_DialTable* base = ref.table;  // a history table is routed like its table
         if (ref.history) {
             const SQL1_DialTable* hist = ref.table->histTable.empty() ? nullptr : dict_.find(ref.table->histTable);
             if (hist == nullptr) return fail(SQL1_ST_SYNTAX, "table " + ref.table->name + " has no history");
@@ -367,9 +369,9 @@ int Translator::mainTable() {
             out_->table = ref.table;
             first = false;
         }
-        if (!ref.hasAt || ref.table->nodeColumn.empty() || out_->kind == SQL1_StmtKind::Insert) continue;
+        if (!ref.hasAt || base->nodeColumn.empty() || out_->kind == SQL1_StmtKind::Insert) continue;
         if (!own) return fail(SQL1_ST_SYNTAX, "AT is supported on the statement's own table only");
-        int rc = routing(ref);
+        int rc = routing(ref, base);
         if (rc != SQL1_OK) return rc;
     }
     return SQL1_OK;
@@ -386,13 +388,13 @@ std::string Translator::quote(const std::string& v) const {
 }
 
 // Limits the rows of the statement's table to the AT nodes.
-int Translator::routing(const TableRef& ref) {
+int Translator::routing(const TableRef& ref, const SQL1_DialTable* base) {
     std::string list;
     for (const std::string& n : ref.nodes) list += (list.empty() ? "" : ",") + quote(n);
-    std::string col = "\"" + ref.table->nodeColumn + "\"";
+    std::string col = "\"" + base->nodeColumn + "\"";
     std::string pred = col + " IN (" + list + ")";
     const SQL1_DialTable* status = dict_.find("O4SRV.INODESTS");
-    if (ref.table->viaThru && status != nullptr) {
+    if (base->viaThru && status != nullptr) {
         pred = "(" + pred + " OR " + col + " IN (SELECT NODE FROM \"" + status->name + "\" WHERE THRUNODE IN (" + list +
                ")))";
     }

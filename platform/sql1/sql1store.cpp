@@ -35,7 +35,8 @@ bool startsWithNoCase(std::string_view s, std::string_view prefix) {
 
 // The layer's own tables and SQLite's: never reachable by client statements.
 bool internalName(const char* name) {
-    return name != nullptr && (startsWithNoCase(name, "CSIT_") || startsWithNoCase(name, "sqlite_"));
+    return name != nullptr &&
+           (startsWithNoCase(name, "CSIT_") || startsWithNoCase(name, "sqlite_") || startsWithNoCase(name, "pragma_"));
 }
 
 // Statements sent through the layer may read every store table, write every

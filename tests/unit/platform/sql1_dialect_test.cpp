@@ -16,7 +16,7 @@ public:
         add({"O4SRV.INODESTS", "", false, "", {{"NODE", 452, 32}, {"THRUNODE", 452, 32}, {"PRODUCT", 452, 2}}});
         add({"ZAG.CPU", "ORIGINNODE", true, "ZAG.CPU_HIST",
              {{"ORIGINNODE", 452, 32}, {"CPUID", 500, 2}, {"BUSYPCT", 496, 4}}});
-        add({"ZAG.CPU_HIST", "ORIGINNODE", true, "",
+        add({"ZAG.CPU_HIST", "", false, "",
              {{"WRITETIME", 452, 16}, {"ORIGINNODE", 452, 32}, {"CPUID", 500, 2}, {"BUSYPCT", 496, 4}}});
         add({"SYSTEM.SYSAPPLS", "NODE", false, "", {{"NODE", 452, 32}, {"APPL_NAME", 452, 8}}});
     }
