@@ -16,7 +16,10 @@
 // white space (space, tab, line feed, carriage return) is dropped, except
 // when it stands between two other pieces of the same element's text (a line
 // break inside a value): then it is kept. Serialisation writes well-formed
-// XML: special characters become character references.
+// XML that parses back into the same tree: special characters become
+// character references (where blanks at an end of a value touch one, that
+// character and those blanks are written as a CDATA section, so that the
+// blanks survive).
 //
 // Results: 0 found or done; 5 not found, no value, end of walk; 6 parse error
 // or element left open; 7 allocation failure or no room (a document holds at

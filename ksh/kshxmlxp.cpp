@@ -125,13 +125,59 @@ struct WriteSink {
     void putEscaped(const char* s, size_t len, bool attr) { p = writeEscaped(p, s, len, attr); }
 };
 
+// Character references start pieces of character data of their own when the
+// text is parsed again, and a piece of blanks alone is dropped. So where the
+// blanks at either end of a value touch a character that is written as a
+// reference, those blanks and that character go into a small CDATA section
+// instead, which the parser delivers as one piece: the blanks survive. (Only
+// spaces and tabs can sit at the ends of a parsed value; the sections hold no
+// ']' and no CR, which the parser would treat apart.)
+bool edgeBlank(char c) { return c == ' ' || c == '\t'; }
+bool escapedInText(char c) { return kEscapes.text[(unsigned char)c] != nullptr && c != '\r'; }
+
+template <class Sink>
+void putCdata(Sink& sink, const char* s, size_t len) {
+    sink.put("<![CDATA[", 9);
+    sink.put(s, len);
+    sink.put("]]>", 3);
+}
+
+template <class Sink>
+void putText(Sink& sink, const char* s, size_t len) {
+    size_t lead = 0;
+    while (lead < len && edgeBlank(s[lead])) ++lead;
+    if (lead == len) {
+        sink.putEscaped(s, len, false);
+        return;
+    }
+    size_t trail = 0;
+    while (edgeBlank(s[len - 1 - trail])) ++trail;
+    size_t first = lead;
+    size_t last = len - 1 - trail;
+    bool leadSection = lead > 0 && escapedInText(s[first]);
+    bool trailSection = trail > 0 && escapedInText(s[last]);
+    if (leadSection && trailSection && first == last) {
+        putCdata(sink, s, len);
+        return;
+    }
+    size_t from = 0;
+    size_t to = len;
+    if (leadSection) {
+        putCdata(sink, s, first + 1);
+        from = first + 1;
+    }
+    if (trailSection) to = last;
+    if (to > from) sink.putEscaped(s + from, to - from, false);
+    if (trailSection) putCdata(sink, s + last, len - last);
+}
+
 template <class Sink>
 void writeValue(Sink& sink, KSH_DOMNode* node, bool mask) {
     if (node->getValueLength() == 0) return;
     if (mask && namesPassword(node->getName()))
         sink.put(kMasked, sizeof kMasked - 1);
     else
-        sink.putEscaped(node->getValue(), node->getValueLength(), false);
+        putText(sink, node->getValue(), node->getValueLength());
 }
 
 // "<name a=\"v\" ...>" and the node's value; restarts the node's child walk.
@@ -776,7 +822,9 @@ void KSH_XML::insertTagname(KSH_DOMNode* node, char** out) {
 void KSH_XML::insertNodeValue(KSH_DOMNode* node, char** out, bool leadingBlank) {
     if (node->getValueLength() == 0) return;
     if (leadingBlank) *(*out)++ = ' ';
-    *out = writeEscaped(*out, node->getValue(), node->getValueLength(), false);
+    WriteSink sink{*out};
+    putText(sink, node->getValue(), node->getValueLength());
+    *out = sink.p;
 }
 
 int KSH_XML::extractMessage(KSH_DOMNode* node, char** text, unsigned* length) {

@@ -316,6 +316,22 @@ TEST(XmlSerialise, WritesStartTagsValuesChildrenAndEndTagsAsWellFormedXml) {
     EXPECT_STREQ(q, "a&b < \"c\" > d\ne\tf\r");
     EXPECT_EQ(value(again->getRoot()), "1 < 2 && 3 > 2 ]]> x\ry");
 
+    // Blanks at the ends of a value with special characters survive the
+    // round trip (escaped, they would come back as white-space-only pieces).
+    auto edges = parsed(
+        "<S><c><![CDATA[  <x> & ]]></c><g>\t]] a > b</g><t><![CDATA[x ]]]]><![CDATA[> ]]></t><o><![CDATA[ & ]]></o><p>a&#13; b</p></S>");
+    std::string edgeText = serialised(*edges, edges->getRoot());
+    EXPECT_EQ(edgeText,
+              "<S><c><![CDATA[  <]]>x&gt; <![CDATA[& ]]></c><g>\t]] a &gt; b</g><t>x ]]<![CDATA[> ]]></t>"
+              "<o><![CDATA[ & ]]></o><p>a&#13; b</p></S>");
+    auto edgesAgain = parsed(edgeText);
+    KSH_DOMNode* e = edgesAgain->getRoot()->getFirstChild();
+    for (const char* want : {"  <x> & ", "\t]] a > b", "x ]]> ", " & ", "a\r b"}) {
+        ASSERT_NE(e, nullptr);
+        EXPECT_EQ(value(e), want);
+        e = edgesAgain->getRoot()->getNextChild();
+    }
+
     // The steps on their own: a name, a value with its leading blank.
     char buf[64];
     char* p = buf;
