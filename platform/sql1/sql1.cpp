@@ -41,22 +41,30 @@ extern const SQL1_Ops kOps;
 // stale handle that happens to match rare.
 class SlotTable {
 public:
+    // Callers may hold another slot's lock; no slot lock is taken here.
     Slot* alloc(Kind kind, void* impl, SQL1_Handle* h) {
-        std::lock_guard<std::mutex> g(mu_);
-        if (free_.empty()) {
-            constexpr size_t kChunk = 256;
-            Slot* chunk = new Slot[kChunk];
-            for (size_t i = 0; i < kChunk; i++) free_.push_back(&chunk[i]);
+        Slot* s;
+        uint16_t id;
+        {
+            std::lock_guard<std::mutex> g(mu_);
+            if (free_.empty()) {
+                constexpr size_t kChunk = 256;
+                Slot* chunk = new Slot[kChunk];
+                for (size_t i = 0; i < kChunk; i++) free_.push_back(&chunk[i]);
+            }
+            s = free_.front();
+            free_.pop_front();
+            if (++nextId_ == 0) nextId_ = 1;
+            id = nextId_;
         }
-        Slot* s = free_.front();
-        free_.pop_front();
-        if (++nextId_ == 0) nextId_ = 1;
-        std::lock_guard<std::mutex> sg(s->mu);
+        // No slot lock here: the slot came off the free list (after its
+        // release, through mu_), and whoever reads kind and impl does so only
+        // after seeing the id stored last, with release/acquire ordering.
         s->ops = &kOps;
         s->kind = kind;
         s->impl = impl;
-        s->id.store(nextId_, std::memory_order_release);
-        *h = {nextId_, s};
+        s->id.store(id, std::memory_order_release);
+        *h = {id, s};
         return s;
     }
     void recycle(Slot* s) {
@@ -179,7 +187,7 @@ int withObject(SQL1_Handle h, Kind kind, const char* where, Body&& body) {
     Slot* s = static_cast<Slot*>(h.object);
     if (s == nullptr || h.id == 0) return SQL1_ST_STALE;
     std::lock_guard<std::mutex> g(s->mu);
-    if (s->id.load(std::memory_order_relaxed) != h.id || s->kind != kind) return SQL1_ST_STALE;
+    if (s->id.load(std::memory_order_acquire) != h.id || s->kind != kind) return SQL1_ST_STALE;
     T* obj = static_cast<T*>(s->impl);
     return PFM1_Guard(where, [&] { return body(*obj); });
 }
@@ -195,7 +203,7 @@ int releaseHandle(SQL1_Handle h, bool allowRow) {
     void* impl;
     {
         std::lock_guard<std::mutex> g(s->mu);
-        if (s->id.load(std::memory_order_relaxed) != h.id) return SQL1_ST_STALE;
+        if (s->id.load(std::memory_order_acquire) != h.id) return SQL1_ST_STALE;
         if (s->kind == Kind::Row && !allowRow) return SQL1_ST_BADARG;
         kind = s->kind;
         impl = s->impl;
@@ -727,7 +735,7 @@ int opGetParma(SQL1_Handle h, int index, const char** name, const char** value) 
     bool isStmt = false;
     if (s != nullptr) {
         std::lock_guard<std::mutex> g(s->mu);
-        isStmt = s->kind == Kind::Stmt;
+        isStmt = s->id.load(std::memory_order_acquire) == h.id && s->kind == Kind::Stmt;
     }
     if (isStmt) {
         return withObject<StmtObj>(h, Kind::Stmt, "SQL1 parma", [&](StmtObj& o) -> int { return parmaOf(*o.tr, index, name, value); });

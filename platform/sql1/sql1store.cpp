@@ -361,6 +361,14 @@ int Sql1Store::create(Sql1Conn* conn, const SQL1_StoreOptions* o) {
     int rc = hashPassword(password, o->minimalHash, hash);
     if (rc == SQL1_OK) rc = conn->execInternal("BEGIN IMMEDIATE");
     if (rc != SQL1_OK) return rc;
+    // Another process or thread may have created it meanwhile.
+    bool empty = true;
+    rc = runInternal(conn, "SELECT count(*) FROM sqlite_master", {},
+                     [&](sqlite3_stmt* st) { empty = sqlite3_column_int(st, 0) == 0; });
+    if (rc != SQL1_OK || !empty) {
+        int end = conn->execInternal("COMMIT");
+        return rc != SQL1_OK ? rc : end;
+    }
     rc = conn->execInternal(schema.c_str());
     if (rc == SQL1_OK) rc = conn->execInternal(seed.c_str());
     if (rc == SQL1_OK) {
