@@ -112,10 +112,12 @@ struct SQL1_SqlVar {
 // A descriptor (SQLDA). Descriptors belong to the request (input) or its row
 // (output) and are freed when the request is released.
 //  - input: each entry's data has room for maxLength bytes (+1 for a
-//    terminator), zero-filled at creation; the caller writes values there and
-//    sets length (for 448/1018/1008) before open. Fixed character entries (452,
-//    1022) are read over their maximum length with trailing blanks and NULs
-//    removed.
+//    terminator), zero-filled at creation; the caller writes values there
+//    before open. 448/1018/1008 take `length` bytes (1008 with length 0: the
+//    maximum). For 452/1022/484 a nonzero length gives the value's length,
+//    otherwise the value runs to the first NUL within the maximum; trailing
+//    blanks do not count, and open resets such a length to 0 so that a later
+//    text value is not cut by it. Numbers are read in their fixed sizes.
 //  - output: fetch fills data and length; data always has room for length
 //    bytes plus a terminating NUL, and may move when a row holds a value
 //    longer than any before; read it only until the next fetch.
@@ -270,7 +272,7 @@ struct SQL1_StoreOptions {
     const char* dataDir = nullptr;        // folder with schema.sql and seed.sql (new store);
                                           //   null: environment SQL1_STORE_DATA
     const char* adminUser = nullptr;      // administrator of a new store (null: "sysadmin")
-    const char* adminPassword = nullptr;  // its password; required for a new store
+    const char* adminPassword = nullptr;  // its password (1 to 16 characters); required for a new store
     int minimalHash = 0;                  // 1: Argon2 with the minimum limits (tests); the
                                           //   environment SQL1_PWHASH=min does the same
     int busyMillis = 5000;                // busy time-out of the store's connections
@@ -300,8 +302,9 @@ struct SQL1_StoreInfo {
 };
 [[nodiscard]] int SQL1_GetStoreInfo(const char* storePath, SQL1_StoreInfo* info);
 
-// Adds or replaces a user of the store (password hashed with Argon2; the
-// clear text is not kept). enabled 0 keeps the user but refuses its logon.
+// Adds or replaces a user of the store (user id and password of 1 to 16
+// characters; the password hashed with Argon2, the clear text not kept).
+// enabled 0 keeps the user but refuses its logon.
 [[nodiscard]] int SQL1_SetUser(const char* storePath, const char* userId, const char* password, int enabled,
                                int minimalHash);
 

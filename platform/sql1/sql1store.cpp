@@ -348,9 +348,10 @@ int Sql1Store::create(Sql1Conn* conn, const SQL1_StoreOptions* o) {
     const char* admin = o != nullptr && o->adminUser != nullptr ? o->adminUser : "sysadmin";
     const char* password = o != nullptr ? o->adminPassword : nullptr;
     std::string schema, seed;
-    if (dir == nullptr || password == nullptr || *password == '\0' || std::strlen(admin) > 15 ||
-        std::strlen(password) > 15) {
-        Sql1_SetError("a new store needs its data folder and an administrator with a password of 1 to 15 characters");
+    // User ids and passwords fill at most the 16 bytes of a login id field.
+    if (dir == nullptr || password == nullptr || *password == '\0' || *admin == '\0' || std::strlen(admin) > 16 ||
+        std::strlen(password) > 16) {
+        Sql1_SetError("a new store needs its data folder and an administrator with a password of 1 to 16 characters");
         return SQL1_ST_BADARG;
     }
     if (!readFile(std::string(dir) + "/schema.sql", &schema) || !readFile(std::string(dir) + "/seed.sql", &seed)) {
@@ -600,9 +601,9 @@ int Sql1Store::logon(const char* user, const char* password) {
 }
 
 int Sql1Store::setUser(const char* user, const char* password, int enabled, int minimalHash) {
-    if (user == nullptr || password == nullptr || *user == '\0' || std::strlen(user) > 15 || *password == '\0' ||
-        std::strlen(password) > 15) {
-        Sql1_SetError("user id and password must have 1 to 15 characters");
+    if (user == nullptr || password == nullptr || *user == '\0' || std::strlen(user) > 16 || *password == '\0' ||
+        std::strlen(password) > 16) {
+        Sql1_SetError("user id and password must have 1 to 16 characters");
         return SQL1_ST_BADARG;
     }
     char hash[crypto_pwhash_STRBYTES];

@@ -305,6 +305,16 @@ TEST_F(Sql1Store, TheCommandsStatementsRunAsComposed) {
                      "N'<slot a=\"1\" b=''2''/> & more', \"2250\")"),
               SQL1_OK) << SQL1_LastError();
     Rows rows;
+    // The base-situation read names every column of the definition row.
+    ASSERT_EQ(run(p, "SELECT ADVISE,AFFINITIES,ALERTLIST,AUTOSOPT,AUTOSTART,CMD,DESTNODE,HUB,LOCFLAG,LSTCCSID,LSTDATE,"
+                     "LSTRELEASE,LSTUSRPRF,NOTIFYARGS,NOTIFYOPTS,OBJECTLOCK,PDT,PRNAMES,QIBSCOPE,REEV_DAYS,REEV_TIME,"
+                     "REFLEXOK,SENDMSGQ,SITINFO,SITNAME,SOURCE,TEXT FROM O4SRV.TSITDESC WHERE SITNAME =\"ZAG_CPU_Busy\"",
+                  &rows),
+              SQL1_OK) << SQL1_LastError();
+    ASSERT_EQ(rows.size(), 1u);
+    EXPECT_EQ(rows[0].size(), 27u);
+    EXPECT_EQ(rows[0][24], "ZAG_CPU_Busy");
+    rows.clear();
     ASSERT_EQ(run(p, "SELECT TEXT, REEV_TIME, ADVISE, SENDMSGQ FROM O4SRV.TSITDESC WHERE SITNAME =\"NEWSIT\"", &rows), SQL1_OK);
     EXPECT_EQ(rows, (Rows{{"say \"hi\" it's", "000500", "", "*NONE"}}));  // unnamed columns take their defaults
     rows.clear();
@@ -327,6 +337,8 @@ TEST_F(Sql1Store, TheCommandsStatementsRunAsComposed) {
 TEST_F(Sql1Store, LogonIsRefusedWithItsReasonAndTheLayersTablesStayOutOfReach) {
     ASSERT_EQ(SQL1_SetUser(db_.c_str(), "oper", "op-pass", 1, 1), SQL1_OK);
     ASSERT_EQ(SQL1_SetUser(db_.c_str(), "gone", "gone-pass", 0, 1), SQL1_OK);
+    ASSERT_EQ(SQL1_SetUser(db_.c_str(), "sixteen-chars-id", "sixteen-char-pwd", 1, 1), SQL1_OK);  // fills the fields
+    EXPECT_EQ(SQL1_SetUser(db_.c_str(), "seventeen-chars-x", "pw", 1, 1), SQL1_ST_BADARG);
     const struct {
         const char* user;
         const char* password;
@@ -340,6 +352,8 @@ TEST_F(Sql1Store, LogonIsRefusedWithItsReasonAndTheLayersTablesStayOutOfReach) {
         {"", "op-pass", SQL1_ST_LOGON_NOUSER},
         {"nobody", "op-pass", SQL1_ST_LOGON_UNKNOWN},
         {"gone", "gone-pass", SQL1_ST_LOGON_DISABLED},
+        {"sixteen-chars-id", "sixteen-char-pwd", SQL1_OK},
+        {"sixteen-chars-id", "sixteen-char-pw", SQL1_ST_LOGON_PASSWORD},
     };
     for (const auto& c : cases) {
         SQL1_LoginId id = loginOf(c.user, c.password);
