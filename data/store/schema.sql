@@ -161,7 +161,8 @@ CREATE TABLE "O4SRV.INODESTS" (
 );
 
 -- Actions: commands for the local server (operator messages) and for remote
--- nodes (threshold overrides). ACTSECURE is the requesting user.
+-- nodes (threshold overrides). ACTSECURE is the requesting user. A SELECT
+-- naming a command records it here (see CSIT_TABLES.ACTION).
 CREATE TABLE "O4SRV.CLACTLCL" (
   ACTSECURE   CHAR(10) DEFAULT '',
   CLCMD       VARCHAR(8000) DEFAULT '',
@@ -303,22 +304,30 @@ CREATE TABLE "WAREHOUSE.SNAPSHOT" (
 -- The client layer's own tables
 -- ---------------------------------------------------------------------------
 
--- Routing and history of the tables: NODECOLUMN is the column AT (...)
--- compares with the named nodes (empty: AT does not limit the rows);
+-- Routing, history and actions of the tables: NODECOLUMN is the column
+-- AT (...) compares with the named nodes (empty: AT does not limit the rows);
 -- VIATHRU 1 also takes the rows of nodes whose O4SRV.INODESTS THRUNODE is
--- one of the named nodes; HISTTABLE is the table HISTORY() reads.
+-- one of the named nodes; HISTTABLE is the table HISTORY() reads. ACTION
+-- names the command column of an action table: a SELECT on it whose WHERE
+-- clause is a conjunction of COLUMN = value terms, one of them naming the
+-- command, first records those values as a new row (the command is issued),
+-- and so answers with the recorded command.
 CREATE TABLE CSIT_TABLES (
   TABLENAME   VARCHAR(64) NOT NULL PRIMARY KEY,
   NODECOLUMN  VARCHAR(32) DEFAULT '',
   VIATHRU     INTEGER DEFAULT 0,
-  HISTTABLE   VARCHAR(64) DEFAULT ''
+  HISTTABLE   VARCHAR(64) DEFAULT '',
+  ACTION      VARCHAR(32) DEFAULT ''
 );
-INSERT INTO CSIT_TABLES VALUES ('SYSTEM.SYSAPPLS', 'NODE', 0, '');
-INSERT INTO CSIT_TABLES VALUES ('ZAG.CPU', 'ORIGINNODE', 1, 'ZAG.CPU_HIST');
-INSERT INTO CSIT_TABLES VALUES ('ZAG.DISK', 'ORIGINNODE', 1, 'ZAG.DISK_HIST');
-INSERT INTO CSIT_TABLES VALUES ('ZAG.PROCESS', 'ORIGINNODE', 1, 'ZAG.PROCESS_HIST');
-INSERT INTO CSIT_TABLES VALUES ('O4SRV.TSITSTSH', '', 0, 'O4SRV.TSITSTSH');
-INSERT INTO CSIT_TABLES VALUES ('O4SRV.ISITSTSH', '', 0, 'O4SRV.ISITSTSH');
+INSERT INTO CSIT_TABLES (TABLENAME, NODECOLUMN, VIATHRU, HISTTABLE, ACTION) VALUES
+  ('SYSTEM.SYSAPPLS', 'NODE', 0, '', ''),
+  ('ZAG.CPU', 'ORIGINNODE', 1, 'ZAG.CPU_HIST', ''),
+  ('ZAG.DISK', 'ORIGINNODE', 1, 'ZAG.DISK_HIST', ''),
+  ('ZAG.PROCESS', 'ORIGINNODE', 1, 'ZAG.PROCESS_HIST', ''),
+  ('O4SRV.TSITSTSH', '', 0, 'O4SRV.TSITSTSH', ''),
+  ('O4SRV.ISITSTSH', '', 0, 'O4SRV.ISITSTSH', ''),
+  ('O4SRV.CLACTLCL', '', 0, '', 'CLCMD'),
+  ('O4SRV.CLACTRMT', '', 0, '', 'CLCMD');
 
 -- Users the server validates: Argon2id password hashes (libsodium string
 -- form). ENABLED N refuses the user's logon.

@@ -142,6 +142,7 @@ struct RequestObj {
     std::shared_ptr<const SQL1_Translation> tr;
     Sql1Conn* conn = nullptr;
     sqlite3_stmt* st = nullptr;
+    sqlite3_stmt* record = nullptr;  // the action table's recording insert, or null
     SQL1_Sqlda in{};
     SQL1_Sqlda out{};
     std::vector<size_t> outCap;  // capacity of each output entry's data
@@ -231,6 +232,7 @@ void destroyRequest(RequestObj* r) {
     }
     (void)releaseHandle(r->row, true);
     if (r->st != nullptr) r->conn->giveBack(r->tr->sql, r->st);
+    if (r->record != nullptr) r->conn->giveBack(r->tr->record, r->record);
     r->core->store->release(r->conn);
     freeSqlda(&r->in);
     freeSqlda(&r->out);
@@ -291,11 +293,9 @@ int bindOne(sqlite3_stmt* st, int k, SQL1_SqlVar* v) {
     case SQL1_T_NCHAR:
     case SQL1_T_DECIMAL: {
         // A set length gives the value; otherwise the value runs to the first
-        // NUL within the maximum. Trailing blanks do not count. The length is
-        // consumed, so that a later text value is not cut by an old length.
+        // NUL within the maximum. Trailing blanks do not count.
         size_t n = v->length != 0 ? std::min(v->length, v->maxLength) : strnlen(d, v->maxLength);
         while (n > 0 && (d[n - 1] == ' ' || d[n - 1] == '\0')) n--;
-        v->length = 0;
         return sqlite3_bind_text(st, k, d, static_cast<int>(n), SQLITE_TRANSIENT);
     }
     case SQL1_T_SMALLINT:
@@ -322,9 +322,9 @@ int bindOne(sqlite3_stmt* st, int k, SQL1_SqlVar* v) {
     }
 }
 
-int bindInputs(RequestObj& r, SQL1_Sqlda* in) {
+int bindInputs(RequestObj& r, sqlite3_stmt* st, SQL1_Sqlda* in) {
     for (uint16_t i = 0; i < in->used && i < r.tr->markers.size(); i++) {
-        int rc = bindOne(r.st, i + 1, &in->var[i]);
+        int rc = bindOne(st, i + 1, &in->var[i]);
         if (rc != SQLITE_OK) {
             Sql1_SetError(sqlite3_errmsg(r.conn->db));
             return Sql1_Status(rc);
@@ -475,7 +475,24 @@ int step(RequestObj& r) {
 // Binds and executes (caller has the request to itself).
 int doOpen(RequestObj& r) {
     sqlite3_reset(r.st);
-    int rc = bindInputs(r, &r.in);
+    int rc = SQL1_OK;
+    if (r.record != nullptr) {  // record the action first, so that the select finds it
+        sqlite3_reset(r.record);
+        rc = bindInputs(r, r.record, &r.in);
+        int src = rc == SQL1_OK ? sqlite3_step(r.record) : SQLITE_OK;
+        if (rc == SQL1_OK && src != SQLITE_DONE) {
+            Sql1_SetError(sqlite3_errmsg(r.conn->db));
+            rc = r.core->note(Sql1_Status(src));
+        }
+        sqlite3_reset(r.record);
+    }
+    if (rc == SQL1_OK) rc = bindInputs(r, r.st, &r.in);
+    // Fixed-character lengths are consumed, so that a later text value is
+    // not cut by an old binary length.
+    for (uint16_t i = 0; i < r.in.used; i++) {
+        int16_t t = r.in.var[i].type;
+        if (t == SQL1_T_CHAR || t == SQL1_T_NCHAR || t == SQL1_T_DECIMAL) r.in.var[i].length = 0;
+    }
     if (rc == SQL1_OK) rc = step(r);
     if (rc == SQL1_OK || rc == SQL1_ST_EOD) {
         r.open = true;
@@ -564,6 +581,7 @@ int opCreateRequest(SQL1_Handle stmt, int flags, const SQL1_Exit* exit, SQL1_Han
         st = s.core->store->acquire(&r->conn);
         if (st != SQL1_OK) return s.core->note(st);
         st = r->conn->acquire(r->tr->sql, &r->st);
+        if (st == SQL1_OK && !r->tr->record.empty()) st = r->conn->acquire(r->tr->record, &r->record);
         if (st == SQL1_OK && sqlite3_bind_parameter_count(r->st) != static_cast<int>(r->tr->markers.size())) {
             Sql1_SetError("parameter markers other than ? are not supported");
             st = SQL1_ST_SYNTAX;
@@ -571,6 +589,7 @@ int opCreateRequest(SQL1_Handle stmt, int flags, const SQL1_Exit* exit, SQL1_Han
         if (st == SQL1_OK) st = buildDescriptors(*r);
         if (st != SQL1_OK) {
             if (r->st != nullptr) r->conn->giveBack(r->tr->sql, r->st);
+            if (r->record != nullptr) r->conn->giveBack(r->tr->record, r->record);
             s.core->store->release(r->conn);
             freeSqlda(&r->in);
             freeSqlda(&r->out);

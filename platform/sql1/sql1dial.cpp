@@ -206,6 +206,7 @@ private:
     void typeMarkers();
     int insertColumns(std::vector<std::string>* columns, size_t* valuesOpen);
     int checkLiterals();
+    void actionRecord();
     std::string quote(const std::string& v) const;
     std::string render() const;
 };
@@ -525,6 +526,36 @@ int Translator::checkLiterals() {
     return SQL1_OK;
 }
 
+// For a SELECT on an action table: INSERT INTO table (c...) VALUES (v...)
+// from WHERE c = v AND ... (nothing when the clause has another shape).
+void Translator::actionRecord() {
+    if (out_->kind != SQL1_StmtKind::Select || out_->table == nullptr || out_->table->actionColumn.empty()) return;
+    size_t where = std::string::npos;
+    for (size_t k = refs_.front().index + 1; k < t_.size() && where == std::string::npos; k++) {
+        if (!t_[k].deleted && depth_[k] == 0 && isWord(k, "WHERE")) where = k;
+    }
+    if (where == std::string::npos) return;
+    std::string cols, vals;
+    size_t markers = 0;
+    bool command = false;
+    for (size_t k = next(where);; k = next(k)) {
+        size_t eq = next(k), v = next(eq), after = next(v);
+        const Token& val = t_[v];
+        const SQL1_DialColumn* c = t_[k].kind == Tk::Ident ? out_->table->column(t_[k].text) : nullptr;
+        bool isValue = val.kind == Tk::String || val.kind == Tk::Number || val.kind == Tk::Param;
+        if (c == nullptr || !isPunct(eq, "=") || !isValue) return;
+        cols += (cols.empty() ? "" : ", ") + c->name;
+        vals += (vals.empty() ? "" : ", ") + (val.kind == Tk::String ? quote(val.value) : val.text);
+        if (val.kind == Tk::Param) markers++;
+        if (ieq(c->name, out_->table->actionColumn)) command = true;
+        if (clauseEnd(after)) break;
+        if (!isWord(after, "AND")) return;
+        k = after;
+    }
+    if (!command || markers != out_->markers.size()) return;  // no command, or markers elsewhere
+    out_->record = "INSERT INTO \"" + out_->table->name + "\" (" + cols + ") VALUES (" + vals + ")";
+}
+
 std::string Translator::render() const {
     std::string s;
     for (const Token& tok : t_) {
@@ -556,6 +587,7 @@ int Translator::run(const char* text) {
     if (rc == SQL1_OK) rc = checkLiterals();
     if (rc == SQL1_OK) {
         typeMarkers();
+        actionRecord();
         out_->sql = render();
     }
     return rc;

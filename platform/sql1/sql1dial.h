@@ -39,6 +39,7 @@ struct SQL1_DialTable {
     bool viaThru = false;    // AT also takes rows of nodes reached through a named node
     std::string histTable;   // table HISTORY() reads; empty: none
     std::vector<SQL1_DialColumn> columns;
+    std::string actionColumn;  // action table: its command column (a SELECT naming a command records it)
     // The column of that name (without regard to case), or null.
     const SQL1_DialColumn* column(std::string_view columnName) const;
 };
@@ -65,6 +66,8 @@ struct SQL1_Translation {
     std::vector<std::pair<std::string, std::string>> parmas;  // SYSTEM.PARMA name, value
     std::vector<SQL1_Marker> markers;                         // one per ?, in order
     const SQL1_DialTable* table = nullptr;                    // the statement's own table
+    std::string record;  // SELECT on an action table: the INSERT recording the command's
+                         // COLUMN = value terms (its markers are the SELECT's, in order)
     std::string error;                                        // why translation failed
 };
 

@@ -405,13 +405,14 @@ int Sql1Store::loadDictionary(Sql1Conn* conn) {
         return SQL1_ST_CONNBAD;
     }
     if (rc == SQL1_OK) {
-        rc = runInternal(conn, "SELECT TABLENAME, NODECOLUMN, VIATHRU, HISTTABLE FROM CSIT_TABLES", {},
+        rc = runInternal(conn, "SELECT TABLENAME, NODECOLUMN, VIATHRU, HISTTABLE, ACTION FROM CSIT_TABLES", {},
                          [&](sqlite3_stmt* st) {
                              auto it = tables_.find(upper(col(st, 0)));
                              if (it == tables_.end()) return;
                              it->second.nodeColumn = col(st, 1);
                              it->second.viaThru = sqlite3_column_int(st, 2) != 0;
                              it->second.histTable = col(st, 3);
+                             it->second.actionColumn = col(st, 4);
                          });
     }
     return rc == SQL1_OK ? loadSettings(conn) : rc;

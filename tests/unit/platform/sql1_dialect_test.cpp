@@ -11,14 +11,15 @@ namespace {
 class Dict : public SQL1_DialDictionary {
 public:
     Dict() {
-        add({"O4SRV.TSITDESC", "", false, "", {{"SITNAME", 452, 32}, {"TEXT", 1018, 64}, {"PDT", 1018, 200}}});
-        add({"O4SRV.TOBJACCL", "", false, "", {{"OBJNAME", 452, 32}, {"NODEL", 452, 32}}});
-        add({"O4SRV.INODESTS", "", false, "", {{"NODE", 452, 32}, {"THRUNODE", 452, 32}, {"PRODUCT", 452, 2}}});
+        add({"O4SRV.TSITDESC", "", false, "", {{"SITNAME", 452, 32}, {"TEXT", 1018, 64}, {"PDT", 1018, 200}}, ""});
+        add({"O4SRV.TOBJACCL", "", false, "", {{"OBJNAME", 452, 32}, {"NODEL", 452, 32}}, ""});
+        add({"O4SRV.INODESTS", "", false, "", {{"NODE", 452, 32}, {"THRUNODE", 452, 32}, {"PRODUCT", 452, 2}}, ""});
         add({"ZAG.CPU", "ORIGINNODE", true, "ZAG.CPU_HIST",
-             {{"ORIGINNODE", 452, 32}, {"CPUID", 500, 2}, {"BUSYPCT", 496, 4}}});
+             {{"ORIGINNODE", 452, 32}, {"CPUID", 500, 2}, {"BUSYPCT", 496, 4}}, ""});
         add({"ZAG.CPU_HIST", "", false, "",
-             {{"WRITETIME", 452, 16}, {"ORIGINNODE", 452, 32}, {"CPUID", 500, 2}, {"BUSYPCT", 496, 4}}});
-        add({"SYSTEM.SYSAPPLS", "NODE", false, "", {{"NODE", 452, 32}, {"APPL_NAME", 452, 8}}});
+             {{"WRITETIME", 452, 16}, {"ORIGINNODE", 452, 32}, {"CPUID", 500, 2}, {"BUSYPCT", 496, 4}}, ""});
+        add({"SYSTEM.SYSAPPLS", "NODE", false, "", {{"NODE", 452, 32}, {"APPL_NAME", 452, 8}}, ""});
+        add({"O4SRV.CLACTLCL", "", false, "", {{"ACTSECURE", 452, 10}, {"CLCMD", 448, 200}}, "CLCMD"});
     }
     const SQL1_DialTable* find(std::string_view name) const override {
         std::string u(name);
@@ -173,6 +174,19 @@ TEST(Sql1Dialect, LiteralsLongerThanTheirCharacterColumnAreRefused) {
     EXPECT_EQ(translate(upd.c_str()).rc, SQL1_ST_TOOLONG);
     // Expressions and numeric columns are not measured.
     EXPECT_EQ(translate("UPDATE ZAG.CPU SET BUSYPCT = 123456789012 WHERE CPUID = 1").rc, SQL1_OK);
+}
+
+TEST(Sql1Dialect, ASelectNamingACommandOnAnActionTableAlsoRecordsIt) {
+    Result r = translate("SELECT ACTSECURE,CLCMD FROM O4SRV.CLACTLCL WHERE  ACTSECURE = \"op\" AND CLCMD = ?");
+    ASSERT_EQ(r.rc, SQL1_OK) << r.tr.error;
+    EXPECT_EQ(r.tr.record, "INSERT INTO \"O4SRV.CLACTLCL\" (ACTSECURE, CLCMD) VALUES ('op', ?)");
+    // Other shapes only read; so does every other table.
+    EXPECT_EQ(translate("SELECT CLCMD FROM O4SRV.CLACTLCL WHERE ACTSECURE = \"op\" OR CLCMD = \"x\"").tr.record, "");
+    EXPECT_EQ(translate("SELECT CLCMD FROM O4SRV.CLACTLCL WHERE ACTSECURE LIKE \"op\"").tr.record, "");
+    EXPECT_EQ(translate("SELECT CLCMD FROM O4SRV.CLACTLCL").tr.record, "");
+    EXPECT_EQ(translate("SELECT CLCMD FROM O4SRV.CLACTLCL WHERE ACTSECURE = \"op\"").tr.record, "");  // no command
+    EXPECT_EQ(translate("SELECT ? FROM O4SRV.CLACTLCL WHERE CLCMD = ?").tr.record, "");
+    EXPECT_EQ(translate("SELECT SITNAME FROM O4SRV.TSITDESC WHERE SITNAME = \"x\"").tr.record, "");
 }
 
 TEST(Sql1Dialect, DeclaredTypesGiveCodesAndLengths) {

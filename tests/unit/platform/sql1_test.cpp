@@ -334,6 +334,30 @@ TEST_F(Sql1Store, TheCommandsStatementsRunAsComposed) {
     (void)ops(p)->release(p);
 }
 
+TEST_F(Sql1Store, ActionTablesRecordTheCommandsSelectedThroughThem) {
+    SQL1_Handle p = path();
+    Rows rows;
+    const char* wto =
+        "SELECT ACTSECURE,CLCMD FROM O4SRV.CLACTLCL WHERE  ACTSECURE = \"oper\" AND CLCMD = \"message:severity= "
+        ";Category= ;message=disk full\"";
+    ASSERT_EQ(run(p, wto, &rows), SQL1_OK) << SQL1_LastError();
+    EXPECT_EQ(rows, (Rows{{"oper", "message:severity= ;Category= ;message=disk full"}}));
+    EXPECT_EQ(count(p, "O4SRV.CLACTLCL"), 1);
+    // With bound values, as threshold overrides are sent.
+    Req r;
+    ASSERT_EQ(create(p, "SELECT CLCMD FROM O4SRV.CLACTRMT WHERE ACTSECURE = ? AND CLCMD = ?", &r), SQL1_OK);
+    std::memcpy(r.in->var[0].data, "oper", 4);
+    std::memcpy(r.in->var[1].data, "thresh:<overrides/>", 19);
+    r.in->var[1].length = 19;
+    ASSERT_EQ(ops(r.req)->open(r.req, r.in), SQL1_OK) << SQL1_LastError();
+    rows.clear();
+    ASSERT_EQ(fetchAll(r, &rows), SQL1_OK);
+    EXPECT_EQ(rows, (Rows{{"thresh:<overrides/>"}}));
+    drop(r);
+    EXPECT_EQ(count(p, "O4SRV.CLACTRMT", "ACTSECURE = \"oper\""), 1);
+    (void)ops(p)->release(p);
+}
+
 TEST_F(Sql1Store, LogonIsRefusedWithItsReasonAndTheLayersTablesStayOutOfReach) {
     ASSERT_EQ(SQL1_SetUser(db_.c_str(), "oper", "op-pass", 1, 1), SQL1_OK);
     ASSERT_EQ(SQL1_SetUser(db_.c_str(), "gone", "gone-pass", 0, 1), SQL1_OK);
