@@ -117,6 +117,13 @@ size_t WSQL_Catalog::NumTables() const {
     return tables_.size();
 }
 
+WSQL_Table* WSQL_Catalog::NextTable(const char* after) const {
+    if (!usable_) return nullptr;
+    Hold hold(&lock_);
+    auto it = after ? tables_.upper_bound(after) : tables_.begin();
+    return it == tables_.end() ? nullptr : it->second;
+}
+
 void WSQL_Catalog::Dump(int level) const {
     if (!usable_) return;
     Hold hold(&lock_);

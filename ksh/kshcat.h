@@ -54,6 +54,11 @@ public:
     int RemoveAttributeFile(const char* name);
 
     size_t NumTables() const;
+    // The first table, in catalog order, whose name sorts after `after`
+    // (null: the first table), or null. Walks the catalog without holding
+    // its lock between steps: tables added meanwhile are met when they sort
+    // later.
+    WSQL_Table* NextTable(const char* after) const;
 
     // Traces every table in catalog order (with its columns when `level` is
     // not 0).

@@ -249,17 +249,4 @@ TEST_F(AttrParserTest, TheDefaultDirectoryComesFromTheEnvironment) {
     EXPECT_STREQ(p.getFullName(buf, sizeof buf, "/d", "f.atr"), "/d/f.atr");
 }
 
-TEST_F(AttrParserTest, TrimKeepsTabsAndHonoursTheLength) {
-    char a[] = "  a\tb \r\n";
-    EXPECT_STREQ(WSQL_AttrParser::trim(a, -1), "a\tb");
-    char b[] = "  abc   ";
-    EXPECT_STREQ(WSQL_AttrParser::trim(b, 4), "ab");
-    char c[] = "   ";
-    EXPECT_STREQ(WSQL_AttrParser::trim(c, -1), "");
-    WSQL_AttrParser p(&cat_);
-    char line[] = "x";
-    EXPECT_EQ(p.getLine(line, sizeof line), 2);  // no file open
-    EXPECT_EQ(p.closeFile(), 2);
-}
-
 }  // namespace

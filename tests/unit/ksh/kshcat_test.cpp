@@ -64,6 +64,12 @@ TEST(Catalog, LookUpsFollowTheirCaseRulesAndTreeOrder) {
     delete dup;
     EXPECT_EQ(cat.AddTable(nullptr), 2);
 
+    // Walking by name visits every table once, in byte order.
+    std::string walk;
+    for (WSQL_Table* t = cat.NextTable(nullptr); t; t = cat.NextTable(t->TableName())) walk += std::string(t->TableName()) + " ";
+    EXPECT_EQ(walk, "KAB.TSITDESC NODOT O4SRV.TSITDESC ");
+    EXPECT_EQ(cat.NextTable("O4SRV.TSITDESC"), nullptr);
+
     EXPECT_EQ(cat.RemoveTable("KAB.TSITDESC"), 0);
     EXPECT_EQ(cat.RemoveTable("KAB.TSITDESC"), 5);
     EXPECT_STREQ(cat.GetUnqualifiedTable("TSITDESC")->TableName(), "O4SRV.TSITDESC");
