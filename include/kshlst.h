@@ -11,6 +11,10 @@
 //
 // Counts are 16-bit: a list links at most 65535 elements, live and marked
 // together. An add beyond that is refused with 2 and changes nothing.
+//
+// Elements come from small blocks the list allocates as it grows; the room of
+// a removed element is reused by later adds and all of it is released when
+// the list is destroyed (a list keeps the room of its largest size).
 #pragma once
 
 #include <cstdint>
@@ -136,6 +140,10 @@ private:
     // Calls the destructor on each value of the detached chain `first` (linked
     // through Next, null-terminated) and frees the elements.
     void destroyChain(LinkedListElem* first);
+    // Element room from the list's blocks; null when no block can be had.
+    void* allocElem();
+    // Destroys `e` (unlinking it) and keeps its room for reuse.
+    void freeElem(LinkedListElem* e);
 
     uint16_t markCount = 0;      // marked entries still linked
     uint16_t iteratorCount = 0;  // registered iterators
@@ -144,6 +152,10 @@ private:
     LinkedListElem* head = nullptr;
     WSQL_Lock* lock = nullptr;
     Destructor destructor = nullptr;
+    void* blocks = nullptr;     // element blocks, chained through their first word
+    void* freeCells = nullptr;  // room of removed elements, chained
+    uint32_t blockUsed = 0;     // cells handed out from the newest block
+    uint32_t blockCells = 0;    // cells in the newest block
 };
 
 // A walk over a list. Registering (construction) and finishing (destruction)

@@ -28,11 +28,30 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <new>
 
 #include "kshlst.h"
 
 struct XML1_ParserStruct;
 class KSH_DOMNode;
+
+// Room for a document's nodes, names and first value pieces, handed out from
+// large chunks and released all at once with the document. Internal.
+class KSH_Arena {
+public:
+    KSH_Arena() = default;
+    ~KSH_Arena();
+    KSH_Arena(const KSH_Arena&) = delete;
+    KSH_Arena& operator=(const KSH_Arena&) = delete;
+    // `n` bytes aligned for any object, or null (memory short, or a piece
+    // too large to be worth keeping here: the caller then uses malloc).
+    void* alloc(size_t n);
+
+private:
+    void* chunks = nullptr;  // chained through their first word
+    char* next = nullptr;
+    size_t left = 0;
+};
 
 // The `parent` argument of getElementValue that stands for any parent.
 #define KSH_ANY_PARENT (reinterpret_cast<KSH_DOMNode*>(~static_cast<uintptr_t>(0)))
@@ -66,6 +85,18 @@ public:
     KSH_DOMNode(const KSH_DOMNode&) = delete;
     KSH_DOMNode& operator=(const KSH_DOMNode&) = delete;
 
+    // Nodes live in C allocator memory; delete releases it with free.
+    static void* operator new(size_t size) noexcept(false);
+    static void* operator new(size_t size, const std::nothrow_t&) noexcept;
+    static void operator delete(void* p) noexcept;
+    // A node with its name in the same room, taken from `arena` (then the
+    // node is destroyed with destroy(), its room going with the arena) or,
+    // with a null arena, from malloc (delete it). Null when memory is short.
+    static KSH_DOMNode* create(const char* name, const char** atts, KSH_Arena* arena);
+    // Deletes a node made anywhere: runs the destructor and frees its room
+    // unless that belongs to an arena.
+    static void destroy(KSH_DOMNode* node);
+
     // False when the name or an attribute could not be copied.
     bool valid() const { return name != nullptr && !attributeFailed; }
 
@@ -85,8 +116,10 @@ public:
     int addChild(KSH_DOMNode* child);
     // Append character data (white-space rule above). 0, or 7 when memory is
     // short (the piece is then dropped and the old value stays).
-    int setValue(const char* s, int len);
+    int setValue(const char* s, int len) { return appendValue(s, len, nullptr); }
     int setNativeValue(const char* s, int len) { return setValue(s, len); }
+    // setValue, taking a first piece's room from `arena` when one is given.
+    int appendValue(const char* s, int len, KSH_Arena* arena);
     // Forgets white space held back for the next piece (at element events).
     void dropPending() { pendingLength = 0; }
 
@@ -108,8 +141,12 @@ public:
     size_t fullNameLength() const;
 
 private:
+    struct InlineName {};
+    KSH_DOMNode(char* name, size_t length, const char** atts, bool inArena, InlineName);
+    void setNameLength(size_t length);
+    void addAttributes(const char** atts);
     int addAttribute(const char* n, const char* v);
-    bool ensureValueRoom(size_t bytes);
+    bool ensureValueRoom(size_t bytes, KSH_Arena* arena);
 
     char* name;
     uint16_t nameLength = 0;       // saturates at 65535 (see fullNameLength)
@@ -123,6 +160,9 @@ private:
     LinkedListIter* childIter = nullptr;      // made on the first walk
     LinkedListIter* attributeIter = nullptr;  // made on the first walk
     bool attributeFailed = false;
+    bool ownsName = true;          // false when the name shares the node's room
+    bool inArena = false;          // the node's room belongs to an arena
+    bool valueInArena = false;     // `value` belongs to an arena (not freed, not grown in place)
 };
 
 class KSH_XML {
@@ -244,4 +284,5 @@ private:
     int buildRc = 0;                     // first failure while building, 0 if none
     const char* buildWhy = nullptr;      // its text (static)
     XML1_ParserStruct* parser = nullptr; // the parser while parseMessage runs
+    KSH_Arena arena;                     // room of the nodes; outlives `elements`
 };

@@ -5,16 +5,51 @@
 // list again (the lock is recursive) and always finds it consistent.
 #include "kshlst.h"
 
+#include <cstdlib>
 #include <new>
 
 #include "ras1/ras1.h"
 #include "wsql_rc.h"
+
+#if defined(__has_feature)
+#if __has_feature(address_sanitizer)
+#define KSHLST_ASAN 1
+#endif
+#elif defined(__SANITIZE_ADDRESS__)
+#define KSHLST_ASAN 1
+#endif
+#ifdef KSHLST_ASAN
+#include <sanitizer/asan_interface.h>
+// Room not in use stays poisoned, so touching a removed element is still
+// reported as a use after free.
+#define KSHLST_POISON(p, n) ASAN_POISON_MEMORY_REGION((p), (n))
+#define KSHLST_UNPOISON(p, n) ASAN_UNPOISON_MEMORY_REGION((p), (n))
+#else
+#define KSHLST_POISON(p, n) ((void)(p), (void)(n))
+#define KSHLST_UNPOISON(p, n) ((void)(p), (void)(n))
+#endif
 
 RAS1_UNIT("kshlst");
 
 namespace {
 // The most elements (live and marked) one list links: the counts are 16-bit.
 constexpr unsigned kMaxLinked = 0xFFFF;
+
+// Element blocks: a header word chaining the blocks, then the cells. The
+// first block of a list holds 4 cells, each next one twice as many, up to 256
+// (a leaf's short list costs one small allocation, a long one few).
+union Cell {
+    Cell* nextFree;
+    alignas(LinkedListElem) unsigned char room[sizeof(LinkedListElem)];
+};
+struct alignas(Cell) BlockHeader {
+    void* next;
+    uint32_t cells;
+};
+constexpr uint32_t kFirstBlockCells = 4;
+constexpr uint32_t kMaxBlockCells = 256;
+
+Cell* cellsOf(void* block) { return reinterpret_cast<Cell*>(static_cast<BlockHeader*>(block) + 1); }
 }  // namespace
 
 // ---------------------------------------------------------------- WSQL_Lock
@@ -69,8 +104,46 @@ LinkedList::~LinkedList() {
     }
     Unlock();
     Clear();
+    while (blocks != nullptr) {
+        auto* block = static_cast<BlockHeader*>(blocks);
+        blocks = block->next;
+        KSHLST_UNPOISON(cellsOf(block), block->cells * sizeof(Cell));
+        free(block);
+    }
     if (ownsLock) delete lock;
     lock = nullptr;
+}
+
+void* LinkedList::allocElem() {
+    if (freeCells != nullptr) {
+        Cell* c = static_cast<Cell*>(freeCells);
+        KSHLST_UNPOISON(c, sizeof(Cell));
+        freeCells = c->nextFree;
+        return c;
+    }
+    if (blocks == nullptr || blockUsed == blockCells) {
+        uint32_t cells = blocks == nullptr ? kFirstBlockCells
+                                           : (blockCells < kMaxBlockCells ? blockCells * 2 : kMaxBlockCells);
+        void* block = malloc(sizeof(BlockHeader) + cells * sizeof(Cell));
+        if (block == nullptr) return nullptr;
+        static_cast<BlockHeader*>(block)->next = blocks;
+        static_cast<BlockHeader*>(block)->cells = cells;
+        KSHLST_POISON(cellsOf(block), cells * sizeof(Cell));
+        blocks = block;
+        blockCells = cells;
+        blockUsed = 0;
+    }
+    Cell* c = cellsOf(blocks) + blockUsed++;
+    KSHLST_UNPOISON(c, sizeof(Cell));
+    return c;
+}
+
+void LinkedList::freeElem(LinkedListElem* e) {
+    e->~LinkedListElem();
+    Cell* c = reinterpret_cast<Cell*>(e);
+    c->nextFree = static_cast<Cell*>(freeCells);
+    freeCells = c;
+    KSHLST_POISON(c, sizeof(Cell));
 }
 
 void LinkedList::Lock() {
@@ -83,8 +156,9 @@ void LinkedList::Unlock() {
 
 int LinkedList::linkEntry(void* v, bool asHead) {
     if ((unsigned)numEntries + markCount >= kMaxLinked) return WSQL_NOTHING;
-    LinkedListElem* e = new (std::nothrow) LinkedListElem(v, head);
-    if (e == nullptr) return WSQL_NOTHING;
+    void* room = allocElem();
+    if (room == nullptr) return WSQL_NOTHING;
+    LinkedListElem* e = new (room) LinkedListElem(v, head);
     if (head == nullptr || asHead) head = e;
     ++numEntries;
     return WSQL_OK;
@@ -120,7 +194,7 @@ void* LinkedList::unlinkElem(LinkedListElem* e) {
     else if (e == head)
         head = e->Next();
     void* v = e->Value();
-    delete e;
+    freeElem(e);
     return v;
 }
 
@@ -202,7 +276,7 @@ void LinkedList::destroyChain(LinkedListElem* first) {
         // that its destructor's unlink touches nothing else.
         e->Next(e);
         e->Prev(e);
-        delete e;
+        freeElem(e);
         if (destructor && destroy) destructor(v);
     }
 }

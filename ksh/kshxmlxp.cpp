@@ -11,11 +11,29 @@
 // without attributes.
 #include "kshxmlxp.h"
 
+#include <cstddef>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <new>
 
+#if defined(__has_feature)
+#if __has_feature(address_sanitizer)
+#define KSHXMLXP_ASAN 1
+#endif
+#elif defined(__SANITIZE_ADDRESS__)
+#define KSHXMLXP_ASAN 1
+#endif
+#ifdef KSHXMLXP_ASAN
+#include <sanitizer/asan_interface.h>
+#define KSHXMLXP_POISON(p, n) ASAN_POISON_MEMORY_REGION((p), (n))
+#define KSHXMLXP_UNPOISON(p, n) ASAN_UNPOISON_MEMORY_REGION((p), (n))
+#else
+#define KSHXMLXP_POISON(p, n) ((void)(p), (void)(n))
+#define KSHXMLXP_UNPOISON(p, n) ((void)(p), (void)(n))
+#endif
+
+#include "bss1/bss1.h"
 #include "kshutil.h"
 #include "ras1/ras1.h"
 #include "wsql_rc.h"
@@ -231,6 +249,99 @@ void serialise(Sink& sink, KSH_DOMNode* top, bool mask) {
 
 }  // namespace
 
+// ---------------------------------------------------------------- KSH_Arena
+
+namespace {
+// Chunks of 64 KiB; pieces above 2 KiB go to malloc instead (a chunk would
+// waste too much of itself on them). Under ASan, room not handed out stays
+// poisoned and each piece is followed by a poisoned gap, so overruns are
+// still caught.
+constexpr size_t kChunkSize = 64 * 1024;
+constexpr size_t kLargestPiece = 2 * 1024;
+constexpr size_t kAlign = alignof(std::max_align_t);
+#ifdef KSHXMLXP_ASAN
+constexpr size_t kGap = kAlign;
+#else
+constexpr size_t kGap = 0;
+#endif
+struct alignas(std::max_align_t) ChunkHeader {
+    void* next;
+};
+
+// Chunks of finished documents, kept for the next ones (up to 4 MiB): the C
+// allocator would otherwise hand the pages back to the system and the next
+// document would fault them in again.
+constexpr size_t kCachedChunks = 64;
+struct ChunkCache {
+    BSS1_Lock lock;
+    void* chunks = nullptr;  // GUARDED_BY(lock)
+    size_t count = 0;        // GUARDED_BY(lock)
+    ChunkCache() { BSS1_InitializeLock(&lock); }
+};
+
+// Never destroyed: documents may be released by static destructors at exit.
+ChunkCache& chunkCache() {
+    static ChunkCache* cache = new ChunkCache();
+    return *cache;
+}
+
+void* takeChunk() {
+    ChunkCache& cache = chunkCache();
+    BSS1_GetLock(&cache.lock);
+    void* chunk = cache.chunks;
+    if (chunk != nullptr) {
+        KSHXMLXP_UNPOISON(chunk, sizeof(ChunkHeader));
+        cache.chunks = static_cast<ChunkHeader*>(chunk)->next;
+        cache.count--;
+    }
+    BSS1_ReleaseLock(&cache.lock);
+    return chunk != nullptr ? chunk : malloc(kChunkSize);
+}
+
+// Returns a document's chain of chunks: cached while there is room, else freed.
+void giveChunks(void* chain) {
+    ChunkCache& cache = chunkCache();
+    BSS1_GetLock(&cache.lock);
+    while (chain != nullptr && cache.count < kCachedChunks) {
+        void* chunk = chain;
+        KSHXMLXP_UNPOISON(chunk, kChunkSize);
+        chain = static_cast<ChunkHeader*>(chunk)->next;
+        static_cast<ChunkHeader*>(chunk)->next = cache.chunks;
+        KSHXMLXP_POISON(static_cast<char*>(chunk) + sizeof(ChunkHeader), kChunkSize - sizeof(ChunkHeader));
+        cache.chunks = chunk;
+        cache.count++;
+    }
+    BSS1_ReleaseLock(&cache.lock);
+    while (chain != nullptr) {
+        void* chunk = chain;
+        KSHXMLXP_UNPOISON(chunk, kChunkSize);
+        chain = static_cast<ChunkHeader*>(chunk)->next;
+        free(chunk);
+    }
+}
+}  // namespace
+
+void* KSH_Arena::alloc(size_t n) {
+    if (n == 0 || n > kLargestPiece) return nullptr;
+    size_t room = (n + kGap + kAlign - 1) & ~(kAlign - 1);
+    if (room > left) {
+        void* chunk = takeChunk();
+        if (chunk == nullptr) return nullptr;
+        static_cast<ChunkHeader*>(chunk)->next = chunks;
+        chunks = chunk;
+        next = static_cast<char*>(chunk) + sizeof(ChunkHeader);
+        left = kChunkSize - sizeof(ChunkHeader);
+        KSHXMLXP_POISON(next, left);
+    }
+    char* p = next;
+    next += room;
+    left -= room;
+    KSHXMLXP_UNPOISON(p, n);
+    return p;
+}
+
+KSH_Arena::~KSH_Arena() { giveChunks(chunks); }
+
 // --------------------------------------------------------- KSH_XMLAttribute
 
 KSH_XMLAttribute::KSH_XMLAttribute(const char* n, const char* v) : name(nullptr), value(nullptr) {
@@ -249,18 +360,52 @@ KSH_XMLAttribute::~KSH_XMLAttribute() { free(name); }
 
 // -------------------------------------------------------------- KSH_DOMNode
 
+void* KSH_DOMNode::operator new(size_t size) noexcept(false) {
+    void* p = malloc(size);
+    if (p == nullptr) throw std::bad_alloc();
+    return p;
+}
+
+void* KSH_DOMNode::operator new(size_t size, const std::nothrow_t&) noexcept { return malloc(size); }
+
+void KSH_DOMNode::operator delete(void* p) noexcept { free(p); }
+
+KSH_DOMNode* KSH_DOMNode::create(const char* n, const char** atts, KSH_Arena* arena) {
+    if (n == nullptr) return nullptr;
+    size_t len = strlen(n);
+    size_t bytes = sizeof(KSH_DOMNode) + len + 1;
+    void* block = arena ? arena->alloc(bytes) : nullptr;
+    bool fromArena = block != nullptr;
+    if (block == nullptr) block = malloc(bytes);
+    if (block == nullptr) return nullptr;
+    char* inlineName = static_cast<char*>(block) + sizeof(KSH_DOMNode);
+    memcpy(inlineName, n, len + 1);
+    return ::new (block) KSH_DOMNode(inlineName, len, atts, fromArena, InlineName{});
+}
+
+void KSH_DOMNode::destroy(KSH_DOMNode* node) {
+    if (node == nullptr) return;
+    if (node->inArena)
+        node->~KSH_DOMNode();
+    else
+        delete node;
+}
+
+KSH_DOMNode::KSH_DOMNode(char* n, size_t length, const char** atts, bool fromArena, InlineName)
+    : name(n), ownsName(false), inArena(fromArena) {
+    setNameLength(length);
+    addAttributes(atts);
+}
+
 KSH_DOMNode::KSH_DOMNode(const char* n, const char** atts) : name(WSQL_Strdup(n)) {
     if (name == nullptr) return;
-    size_t len = strlen(name);
-    nameLength = (uint16_t)(len < 0xFFFF ? len : 0xFFFF);
-    for (int i = 0; atts != nullptr && atts[i] != nullptr && atts[i + 1] != nullptr; i += 2)
-        if (addAttribute(atts[i], atts[i + 1]) != WSQL_OK) break;
+    setNameLength(strlen(name));
+    addAttributes(atts);
 }
 
 KSH_DOMNode::KSH_DOMNode(const char* n, LinkedList* attrs) : name(WSQL_Strdup(n)) {
     if (name == nullptr) return;
-    size_t len = strlen(name);
-    nameLength = (uint16_t)(len < 0xFFFF ? len : 0xFFFF);
+    setNameLength(strlen(name));
     if (attrs == nullptr) return;
     LinkedListIter it(attrs);
     for (void* v = it.Next(); v != nullptr; v = it.Next()) {
@@ -274,8 +419,15 @@ KSH_DOMNode::~KSH_DOMNode() {
     delete attributeIter;
     delete attributes;
     delete children;
-    free(name);
-    free(value);
+    if (ownsName) free(name);
+    if (!valueInArena) free(value);
+}
+
+void KSH_DOMNode::setNameLength(size_t length) { nameLength = (uint16_t)(length < 0xFFFF ? length : 0xFFFF); }
+
+void KSH_DOMNode::addAttributes(const char** atts) {
+    for (int i = 0; atts != nullptr && atts[i] != nullptr && atts[i + 1] != nullptr; i += 2)
+        if (addAttribute(atts[i], atts[i + 1]) != WSQL_OK) break;
 }
 
 size_t KSH_DOMNode::fullNameLength() const { return nameLength < 0xFFFF ? nameLength : strlen(name); }
@@ -301,32 +453,49 @@ int KSH_DOMNode::addChild(KSH_DOMNode* child) {
 
 // The value buffer grows by doubling (a value that arrives in one piece is
 // allocated exactly); held-back white space lives after the value's NUL.
-bool KSH_DOMNode::ensureValueRoom(size_t bytes) {
+bool KSH_DOMNode::ensureValueRoom(size_t bytes, KSH_Arena* arena) {
     if (bytes <= valueCapacity) return true;
     if (bytes > UINT32_MAX) return false;
     size_t grown = valueCapacity == 0 ? bytes : (size_t)valueCapacity * 2;
     if (grown < bytes) grown = bytes;
     if (grown > UINT32_MAX) grown = UINT32_MAX;
-    char* p = static_cast<char*>(realloc(value, grown));
-    if (p == nullptr) return false;
+    char* p;
+    if (valueInArena) {
+        // Arena room cannot grow in place: move the value (and held-back
+        // white space) to new room, in the arena while it is small.
+        p = arena ? static_cast<char*>(arena->alloc(grown)) : nullptr;
+        if (p == nullptr) {
+            p = static_cast<char*>(malloc(grown));
+            if (p == nullptr) return false;
+            valueInArena = false;
+        }
+        memcpy(p, value, valueCapacity);
+    } else {
+        p = static_cast<char*>(realloc(value, grown));
+        if (p == nullptr) return false;
+    }
     value = p;
     valueCapacity = (uint32_t)grown;
     return true;
 }
 
-int KSH_DOMNode::setValue(const char* s, int len) {
+int KSH_DOMNode::appendValue(const char* s, int len, KSH_Arena* arena) {
     if (s == nullptr || len <= 0) return WSQL_OK;
     size_t n = (size_t)len;
     if (allBlank(s, len)) {
         // Only white space between two pieces of text is kept: hold it back
         // until a piece with text follows.
         if (valueLength == 0) return WSQL_OK;
-        if (!ensureValueRoom((size_t)valueLength + 1 + pendingLength + n)) return WSQL_NOMEM;
+        if (!ensureValueRoom((size_t)valueLength + 1 + pendingLength + n, arena)) return WSQL_NOMEM;
         memcpy(value + valueLength + 1 + pendingLength, s, n);
         pendingLength += (uint32_t)n;
         return WSQL_OK;
     }
-    if (!ensureValueRoom((size_t)valueLength + pendingLength + n + 1)) return WSQL_NOMEM;
+    if (value == nullptr && arena != nullptr && (value = static_cast<char*>(arena->alloc(n + 1))) != nullptr) {
+        valueInArena = true;
+        valueCapacity = (uint32_t)(n + 1);
+    }
+    if (!ensureValueRoom((size_t)valueLength + pendingLength + n + 1, arena)) return WSQL_NOMEM;
     if (pendingLength != 0) {
         memmove(value + valueLength, value + valueLength + 1, pendingLength);
         valueLength += pendingLength;
@@ -419,7 +588,7 @@ void KSH_XML::setRootName(const char* name) {
     rootName = copy;
 }
 
-void KSH_XML::xmlElementDestructor(void* node) { delete static_cast<KSH_DOMNode*>(node); }
+void KSH_XML::xmlElementDestructor(void* node) { KSH_DOMNode::destroy(static_cast<KSH_DOMNode*>(node)); }
 void KSH_XML::xmlFragmentDestructor(void* doc) { delete static_cast<KSH_XML*>(doc); }
 
 void KSH_XML::failBuild(int rc, const char* why) {
@@ -532,7 +701,7 @@ void KSH_XML::XMLNativeCharDataHandler(void* doc, const char* s, int len) {
 
 int KSH_XML::addElement(const char* name, const char** atts) {
     if (buildRc != 0) return buildRc;
-    return insertNode(new (std::nothrow) KSH_DOMNode(name, atts));
+    return insertNode(KSH_DOMNode::create(name, atts, &arena));
 }
 
 int KSH_XML::addElement(const char* name, LinkedList* attrs) {
@@ -544,13 +713,13 @@ int KSH_XML::insertNode(KSH_DOMNode* node) {
     if (node == nullptr || !node->valid() || elements == nullptr) {
         const char* why = node && node->getName() ? "too many attributes or no memory for one"
                                                   : "no memory for an element";
-        delete node;
+        KSH_DOMNode::destroy(node);
         failBuild(WSQL_NOMEM, why);
         return WSQL_NOMEM;
     }
     if (elements->NumEntries() >= kMaxElements || elements->AppendEntry(node) != WSQL_OK) {
         bool full = elements->NumEntries() >= kMaxElements;
-        delete node;
+        KSH_DOMNode::destroy(node);
         failBuild(WSQL_NOMEM, full ? "more than 65535 elements" : "no memory for an element");
         return WSQL_NOMEM;
     }
@@ -579,7 +748,7 @@ void KSH_XML::closeElement() {
 
 int KSH_XML::setElementValue(const char* s, int len) {
     if (newest == nullptr || buildRc != 0) return WSQL_OK;
-    int rc = newest->setValue(s, len);
+    int rc = newest->appendValue(s, len, &arena);
     if (rc != WSQL_OK) failBuild(rc, "no memory for a value");
     return rc;
 }

@@ -76,6 +76,28 @@ TEST(XmlParse, ValuesKeepInnerWhiteSpaceAndDropWhiteSpaceAroundElements) {
     EXPECT_EQ(a->getParent(), nullptr);
 }
 
+TEST(XmlParse, LongValuesBuiltFromManyPiecesArriveWhole) {
+    // Many references make many pieces; the value grows well past the size
+    // kept with the nodes and must still be exact, with its line breaks.
+    std::string text = "<R><big>";
+    std::string expect;
+    for (int i = 0; i < 400; ++i) {
+        text += "part" + std::to_string(i) + "&amp;&lt;\n";
+        expect += "part" + std::to_string(i) + "&<\n";
+    }
+    text += "end</big><next>n</next></R>";
+    expect += "end";
+    auto doc = parsed(text);
+    KSH_DOMNode* big = doc->getRoot()->getFirstChild();
+    ASSERT_NE(big, nullptr);
+    EXPECT_EQ(value(big), expect);
+    EXPECT_EQ(big->getValueLength(), expect.size());
+    EXPECT_EQ(value(doc->getRoot()->getNextChild()), "n");
+    std::string out = serialised(*doc, big);
+    auto again = parsed(out);
+    EXPECT_EQ(value(again->getRoot()), expect);
+}
+
 TEST(XmlParse, AttributesKeepOrderAndTheRootNameIsTheFirstElement) {
     auto doc = parsed("<?xml version='1.0'?><soap:Envelope z='1' a=\"2\" m='&quot;3'><b k='v'/></soap:Envelope>");
     EXPECT_STREQ(doc->getRootName(), "soap:Envelope");
