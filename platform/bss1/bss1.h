@@ -61,3 +61,15 @@ struct BSS1_HostInfo {
 };
 // Fills `info`; 0 on success, 8 when the system would not say.
 int BSS1_Info(BSS1_HostInfo* info);
+
+// Threads with a chosen stack size (the gateway sizes every thread it
+// creates). A thread is released by joining it.
+struct BSS1_Thread;
+// Runs `body(arg)` on a new thread with `stackSize` bytes of stack (0: the
+// system's default; a size below the system's minimum is raised to it).
+// 0 with *thread set, or the pthread error number (*thread null).
+int BSS1_CreateThread(BSS1_Thread** thread, size_t stackSize, void (*body)(void*), void* arg);
+// Waits until the thread has ended and releases it. 0, or the error number.
+int BSS1_JoinThread(BSS1_Thread* thread);
+// The system's minimum thread stack in bytes, 0 when it reports none.
+size_t BSS1_MinThreadStack();
