@@ -50,6 +50,14 @@ struct WSQL_Anchor {
     WSQL_LocalServer* localServer = nullptr;  // filled by the server-information call
     WSQL_AnchorEvent completion;              // signalled when the main routine ends
     uint32_t threadStackSize = 0;             // bytes, for every thread the gateway creates
+
+    // The host's calls, used in START mode only (null: the host offers none,
+    // and START mode cannot start). serverInfo is given the addresses of
+    // hostField and localServer and fills the latter (the record stays the
+    // host's); 0 = success. configCompare answers 0 when the host's
+    // configuration variable `name` has the value `value`.
+    int (*serverInfo)(void** hostField, WSQL_LocalServer** localServer) = nullptr;
+    int (*configCompare)(const char* name, const char* value) = nullptr;
 };
 
 // The anchor of the running gateway; null when started without one.
