@@ -1,5 +1,6 @@
 // kuitext: the text helpers of the support library: name classes, UTF-8
 // conversion, trimming, quote escaping and the SITINFO check.
+#include <unicode/ucnv.h>
 #include <unicode/unistr.h>
 
 #include <cctype>
@@ -206,9 +207,19 @@ int hasNonLatin(const char* text) {
 
 char* convertToUTF8(const char* text) {
     if (!text) return nullptr;
-    icu::UnicodeString u(text, static_cast<const char*>(nullptr));  // the default code page
+    // The default converter follows the process's code page (and a name set
+    // with ucnv_setDefaultName), as the command's own conversions do.
+    UErrorCode status = U_ZERO_ERROR;
+    UConverter* conv = ucnv_open(nullptr, &status);
     std::string utf8;
-    u.toUTF8String(utf8);
+    if (U_SUCCESS(status)) {
+        int32_t n = (int32_t)strlen(text);
+        std::vector<UChar> wide((size_t)n + 1);
+        int32_t units = ucnv_toUChars(conv, wide.data(), n + 1, text, n, &status);
+        if (U_SUCCESS(status)) icu::UnicodeString(wide.data(), units).toUTF8String(utf8);
+        ucnv_close(conv);
+    }
+    if (U_FAILURE(status)) utf8 = text;  // no converter: the bytes as they are
     char* copy = new char[utf8.size() + 1];
     memcpy(copy, utf8.c_str(), utf8.size() + 1);
     return copy;

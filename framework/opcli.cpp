@@ -217,7 +217,7 @@ int runHelp(int argc, char** argv) {
 // Asks the server for its hub node; 0 with *hub, 4 unreachable, 7 refused.
 int verifyLogin(OPCLI_Context* ctx, std::string* hub) {
     std::vector<char> buf(KUI_MSGBUF_SIZE, '\0');
-    snprintf(buf.data(), buf.size(), "SELECT VALUE FROM SYSTEM.SERVERINFO WHERE NAME = \"HUBNODE\"");
+    snprintf(buf.data(), buf.size(), "<![CDATA[SELECT VALUE FROM SYSTEM.SERVERINFO WHERE NAME = \"HUBNODE\"]]>");
     char* reply = nullptr;
     int rc = issueSoapRequest(ctx, buf.data(), 0, &reply, nullptr);
     if (rc != KUI_OK || !reply) return KUI_COMM;
