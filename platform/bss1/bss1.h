@@ -71,5 +71,8 @@ struct BSS1_Thread;
 int BSS1_CreateThread(BSS1_Thread** thread, size_t stackSize, void (*body)(void*), void* arg);
 // Waits until the thread has ended and releases it. 0, or the error number.
 int BSS1_JoinThread(BSS1_Thread* thread);
+// Lets the thread run on by itself; it is released when it ends. 0, or the
+// error number.
+int BSS1_DetachThread(BSS1_Thread* thread);
 // The system's minimum thread stack in bytes, 0 when it reports none.
 size_t BSS1_MinThreadStack();

@@ -12,12 +12,16 @@ struct BSS1_Thread {
     pthread_t id;
     void (*body)(void*);
     void* arg;
+    bool detached;  // the thread releases its record itself
 };
 
 namespace {
+// A detached thread's record is freed by the thread; which of the two ends
+// first is settled by an atomic exchange on `detached`.
 void* threadMain(void* p) {
     auto* t = static_cast<BSS1_Thread*>(p);
     t->body(t->arg);
+    if (__atomic_exchange_n(&t->detached, true, __ATOMIC_ACQ_REL)) delete t;
     return nullptr;
 }
 }  // namespace
@@ -57,4 +61,13 @@ int BSS1_JoinThread(BSS1_Thread* thread) {
     int rc = pthread_join(thread->id, nullptr);
     delete thread;
     return rc;
+}
+
+int BSS1_DetachThread(BSS1_Thread* thread) {
+    if (thread == nullptr) return EINVAL;
+    int rc = pthread_detach(thread->id);
+    if (rc != 0) return rc;
+    // The thread may have ended already: then it left the record to us.
+    if (__atomic_exchange_n(&thread->detached, true, __ATOMIC_ACQ_REL)) delete thread;
+    return 0;
 }
