@@ -234,7 +234,10 @@ public:
     bool hasServerPath();
     // The node identifier given to setServerPath (the hub's own node name),
     // or "" before it is known.
-    const char* getNodeID() const { return nodeId != nullptr ? nodeId : ""; }
+    const char* getNodeID() const {
+        const char* id = nodeId.load(std::memory_order_acquire);
+        return id != nullptr ? id : "";
+    }
     int getValidate() const { return validate.load(std::memory_order_relaxed); }
     void setValidate(int level) { validate.store(level, std::memory_order_relaxed); }
     int getLMSVersion() const { return lmsVersion.load(std::memory_order_relaxed); }
@@ -247,7 +250,11 @@ public:
     void setGlobalState(DS_SQLRequest::SQLSTATE s) { globalState.store(s, std::memory_order_relaxed); }
     // The shared path. REQUIRES: the hub's lock to change it.
     SQL1_Handle getGlobalPathHdl() const { return globalPathHdl; }
-    SQL1_Handle* globalPathHdlRef() { return &globalPathHdl; }
+    // Records a new shared path. REQUIRES: the hub's lock.
+    void setGlobalPath(SQL1_Handle path) {
+        globalPathHdl = path;
+        globalPath = path.object;
+    }
     BSS1_Lock* getLock() { return &lock; }
 
     // Takes the lists (malloc'd texts; a list created with destructor
@@ -306,7 +313,10 @@ private:
     KDH1_server_t kdhServer = 0;
     void* threadId = nullptr;
     char* serverPath = nullptr;  // GUARDED_BY(lock)
-    char* nodeId = nullptr;
+    // Published atomically; a replaced identifier is kept in retiredIds
+    // until the hub goes, since readers hold it without a lock.
+    std::atomic<char*> nodeId{nullptr};
+    LinkedList* retiredIds = nullptr;
     std::atomic<int> validate{WSQL_VALIDATE_UNKNOWN};
     std::atomic<int> lmsVersion{0};
     std::atomic<int> lmsBuild{0};
@@ -316,6 +326,10 @@ private:
     SQL1_Object* globalPath = nullptr;  // GUARDED_BY(lock)
     BSS1_Lock lock;
     DS_SQLSelect* nodeStatusQuery = nullptr;  // GUARDED_BY(cacheLock)
+    // Set when the shared path was dropped: the node status query is then
+    // deleted by its next user (it may be in use right now).
+    std::atomic<bool> nodeStatusStale{false};
+    std::atomic<bool> nodesPrimed{false};
     LinkedList* situations = nullptr;         // Situation*, owned
     LinkedList* templates = nullptr;          // SitTemplate*, owned
     LinkedList* nodes = nullptr;              // Node*, owned
