@@ -52,6 +52,7 @@ class WSQL_Hub;
 class WSQL_HttpServer;
 class WSQL_Table;
 class WSQL_Column;
+class WSQL_SqlText;
 
 // Size of a request's SQL buffer, terminator included.
 constexpr size_t WSQL_SQL_SIZE = 8096;
@@ -61,6 +62,25 @@ constexpr size_t WSQL_NODE_ROUTE_SIZE = 33;
 
 // The request expiry interval's default, seconds.
 constexpr int WSQL_DEFAULT_EXPIRY = 3600;
+
+// Writes `value` (`n` bytes; n < 0: up to the terminator) into `out` as the
+// inside of a double-quoted SQL literal: every double quote is doubled.
+// Returns the length written, or -1 when it does not fit in `size` bytes
+// with its terminator (`out` then holds "").
+int WSQL_EscapeLiteral(const char* value, int n, char* out, size_t size);
+// True when `name` may be pasted into SQL as a name: a letter, '_', '#',
+// '@' or '$' first, then letters, digits, '_', '#', '@', '$' and '.'.
+bool WSQL_IsPlainName(const char* name);
+
+// Cleans an attribute name in place: every character other than a letter,
+// digit or '_' is deleted, then leading characters up to the first letter.
+// Returns 0.
+int WSQL_ConvertAttr(char* name);
+
+// The column `name` of `table`, appended (column and attribute name alike,
+// not hidden, of type `type`) when the table has none; null when memory is
+// short. Serialised, so concurrent requests add a column once.
+WSQL_Column* WSQL_AddDynamicColumn(WSQL_Table* table, const char* name, int type);
 
 // A signal event: a condition, its mutex, a code and a posted flag.
 // Signalling sets code and posted under the mutex and wakes the waiter;
@@ -165,7 +185,9 @@ public:
     // The events body of the action "events".
     int buildEventsXML();
     // Rows converted to topology objects (no XML); a new list owned by the
-    // caller (element destructor set), or null.
+    // caller (element destructor set), or null when the rows cannot be read.
+    // For RESULTS_NODES, `hubName` (hubNameSize + 1 bytes) receives the NODE
+    // of the first "V" row, at most hubNameSize characters.
     LinkedList* GetResults(ResultsType type, char* hubName, int hubNameSize);
 
     // SQL construction (kshreqsql.cpp). Results: 0; 5 nothing to insert or
@@ -222,12 +244,12 @@ private:
     int writeRows(const char* action, bool insertRc);
 
     // SQL helpers (kshreqsql.cpp).
-    int writeSelectList(WSQL_Request_t* rec, size_t* pos);
-    int writeFrom(WSQL_Request_t* rec, size_t* pos);
-    int writeAllTargets(WSQL_Request_t* rec, const char* tableName, size_t* pos);
+    int writeSelectList(WSQL_Request_t* rec, WSQL_SqlText& s);
+    int writeFrom(WSQL_Request_t* rec, WSQL_SqlText& s);
+    int writeAllTargets(WSQL_Request_t* rec, const char* tableName, WSQL_SqlText& s);
     int resolveTarget(WSQL_Request_t* rec, const char** node);
-    int writeParma(WSQL_Request_t* rec, size_t* pos);
-    int writeFilters(WSQL_Request_t* rec, size_t* pos);
+    int writeParma(WSQL_Request_t* rec, WSQL_SqlText& s);
+    int writeFilters(WSQL_Request_t* rec, WSQL_SqlText& s);
     int routingNode(WSQL_Request_t* rec, const char** node) const;
 
     // Row helpers (kshreqout.cpp).
@@ -255,6 +277,6 @@ private:
     char clientHost[WSQL_CREDENTIAL_SIZE];
     SQL1_Exit exitBlock;
     WSQL_SignalEvent completion;
-    char* auxSql;               // malloc'd text of an auxiliary request
+    char* subSqlCopy;           // malloc'd copy of the record's subSql
     char routeNode[WSQL_NODE_ROUTE_SIZE];  // routing node chosen by buildSQL
 };
