@@ -374,26 +374,34 @@ void WSQL_AttrParser::clearCurrentItem() {
 
 int WSQL_AttrParser::doPending() {
     int ras = RAS1_Sync(RAS1_THIS);
-    if (!columnName_[0] || !attributeName_[0]) return 5;
+    RAS1_ENTRY(ras);
+    int rc = 5;
+    if (columnName_[0] && attributeName_[0]) {
+        rc = storeOrDrop(ras);
+        makeNewItem();
+    }
+    RAS1_EXIT_RC(ras, rc);
+    return rc;
+}
+
+int WSQL_AttrParser::storeOrDrop(int ras) {
     bool visible = hideLevel_ <= 0 || (hideLevel_ == 1 && isOneOf(application_, kServerApps));
     // A hidden node column is kept as a hidden column: select lists built
     // from the catalog leave it out, but filters and explicit requests on it
     // still find its name and type.
     bool hiddenNode = !visible && strcmp(columnName_, "ORIGINNODE") == 0;
-    int rc = 0;
     if (!visible && !hiddenNode) {
         if (ras & RAS1_DETAIL)
             RAS1_Printf(RAS1_THIS, __LINE__, "Dropped %s.%s hide level %d", application_, attributeName_, hideLevel_);
-    } else if (!tableName_[0]) {
+        return 0;
+    }
+    if (!tableName_[0]) {
         // No table to put it in: "APPL." would be a table of no name.
         if (ras & RAS1_ERROR)
             RAS1_Printf(RAS1_THIS, __LINE__, "Attribute %s.%s has no table", application_, attributeName_);
-        rc = 5;
-    } else {
-        rc = storeItem(hiddenNode);
+        return 5;
     }
-    makeNewItem();
-    return rc;
+    return storeItem(hiddenNode);
 }
 
 int WSQL_AttrParser::storeItem(bool hidden) {

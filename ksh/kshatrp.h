@@ -148,6 +148,9 @@ protected:
     WSQL_Enum* pending_ = nullptr;  // owned
 
 private:
+    // Applies the visibility rule to a complete item: 0 stored or dropped,
+    // 5 no table named, 7 not added.
+    int storeOrDrop(int ras);
     // Adds the item to the catalog as a column (hidden or not). 0 or 7.
     int storeItem(bool hidden);
     // Completes the pending value pair with `value` as the vale or vali.
