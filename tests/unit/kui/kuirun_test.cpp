@@ -2,6 +2,7 @@
 // checks and property validation.
 #include <cstring>
 
+#include "kgl/kglcnmnt.h"
 #include "kuitesting.h"
 
 namespace {
@@ -229,6 +230,14 @@ TEST(KuiMessage, TheFormsOfTheResultMessageFollowTheCode) {
     constructErrMsg(0, buf.data());
     EXPECT_STREQ(buf.data(), "034I@S@2@A long name@HP");
     kuiResetState();
+}
+
+TEST(KuiInventory, TheModuleDescribesItselfToTheInventory) {
+    EXPECT_EQ(cnt1entd(), 0);
+    const KGL_Contents* c = kglcnqry("createsit");
+    ASSERT_NE(c, nullptr);
+    EXPECT_STREQ(c->name, "createsit");
+    EXPECT_EQ(kglcnqry("nothing"), nullptr);
 }
 
 }  // namespace

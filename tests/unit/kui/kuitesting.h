@@ -35,7 +35,14 @@ inline KuiRunResult kuiRun(const std::vector<std::string>& args) {
     char* slot = nullptr;
     char done = 'N';
     int rc = createsit((int)owned.size(), argv.data(), buf.data(), &slot, 0, nullptr, &done, nullptr, nullptr);
-    return {rc, std::string(buf.data()), done};
+    // Whatever the path: the completion flag is set and the buffer holds
+    // the coded message only, never a statement.
+    std::string message(buf.data());
+    EXPECT_EQ(done, 'Y');
+    EXPECT_EQ(message.find("SELECT"), std::string::npos) << message;
+    EXPECT_EQ(message.find("INSERT"), std::string::npos) << message;
+    EXPECT_NE(message.find('@'), std::string::npos) << "a coded message: " << message;
+    return {rc, message, done};
 }
 
 // The 27 columns of a situation row, in the order the base query names them.
