@@ -11,6 +11,7 @@
 #include "kshcat.h"
 #include "kshcol.h"
 #include "kshlst.h"
+#include "kshreq.h"
 #include "kshtab.h"
 #include "kshutil.h"
 #include "ras1/ras1.h"
@@ -58,22 +59,6 @@ int toInt(const char* text) {
     if (v > INT_MAX) return INT_MAX;
     if (v < INT_MIN) return INT_MIN;
     return (int)v;
-}
-
-bool isAsciiLetter(char c) { return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z'); }
-bool isNameChar(char c) { return isAsciiLetter(c) || (c >= '0' && c <= '9') || c == '_'; }
-
-// Cleans an attribute name in place the way the request layer cleans the
-// names it looks up: every character other than a letter, digit or '_' is
-// removed, then leading characters up to the first letter.
-void convertAttr(char* name) {
-    char* out = name;
-    for (const char* in = name; *in; in++)
-        if (isNameChar(*in)) *out++ = *in;
-    *out = '\0';
-    char* first = name;
-    while (*first && !isAsciiLetter(*first)) first++;
-    if (first != name) memmove(name, first, strlen(first) + 1);
 }
 
 // Copies at most `max` characters of `value` into `field` (max+1 bytes).
@@ -269,7 +254,7 @@ int WSQL_AttrParser::doAttribute(char* value) {
             if (ras & RAS1_DETAIL) RAS1_Printf(RAS1_THIS, __LINE__, "Invalid attribute - %s", attr);
         }
     }
-    convertAttr(attr);
+    WSQL_ConvertAttr(attr);  // the cleaning the request layer applies to the names it looks up
     keep(attributeName_, WSQL_ATR_NAME_MAX, attr);
     return 0;
 }
