@@ -371,7 +371,7 @@ void copyBytes(SQL1_SqlVar* v, const char* text, size_t n) {
 // Binary marker: "0x.." into an entry of 1, 2 or 4 bytes is a number,
 // anything else is copied as bytes.
 void setBinary(SQL1_SqlVar* v, const char* text, size_t n) {
-    bool hex = n > 2 && text[0] == '0' && (text[1] == 'x' || text[1] == 'X') && v->maxLength <= 4;
+    bool hex = std::strlen(text) > 2 && text[0] == '0' && (text[1] == 'x' || text[1] == 'X') && v->maxLength <= 4;
     if (hex) {
         unsigned long value = std::strtoul(text + 2, nullptr, 16);
         switch (v->maxLength) {
