@@ -107,19 +107,6 @@ bool hasRouting(const char* node, WSQL_Hub* hub) {
     return node != nullptr && *node != '\0' && std::strcmp(node, hub->getNodeID()) != 0;
 }
 
-// A filter value with its date/time stamp variable replaced by the current
-// date and time; `out` holds at least strlen(value) + 1 bytes.
-const char* expandDateTime(const char* value, char* out, size_t size) {
-    if (value == nullptr) return "";
-    dateTimeVariableParms parms{};
-    if (parseDateTimeVariable(value, &parms) != 0 || std::strlen(value) >= size) return value;
-    (void)insertDateTimeValue(value, out, &parms);
-    return out;
-}
-
-// Room for one expanded filter value.
-constexpr size_t kValueSize = WSQL_SQL_SIZE;
-
 }  // namespace
 
 int WSQL_EscapeLiteral(const char* value, int n, char* out, size_t size) {
@@ -445,8 +432,7 @@ int WSQL_Request::writeFilters(WSQL_Request_t* rec, SqlText& s) {
         }
         // A column nobody typed is compared as character data.
         int t = col != nullptr ? baseType(col->GetType()) : 452;
-        char expanded[kValueSize];
-        const char* value = expandDateTime(f.value, expanded, sizeof expanded);
+        const char* value = f.value != nullptr ? f.value : "";
         const char* open = "";
         const char* close = "";
         if (t == 1022) {
@@ -631,8 +617,11 @@ int WSQL_Request::buildInput(WSQL_Request_t* rec) {
         return 1;
     }
     bool useValues = rec->numValues > 0;
-    int count = useValues ? rec->numValues : ((type.load() & WSQL_TYPE_SELECT) ? rec->numFilters : 0);
     uint32_t t = type.load();
+    // Without column/value pairs the filters are the values: the markers of
+    // a select's WHERE clause, or the value list of an insert built from
+    // the filters.
+    int count = useValues ? rec->numValues : ((t & (WSQL_TYPE_SELECT | WSQL_TYPE_INSERT)) ? rec->numFilters : 0);
     SQL1_Sqlda* sub = nullptr;
     if ((t & (WSQL_TYPE_SUBSELECT | WSQL_TYPE_BOUNDINPUT)) == (WSQL_TYPE_SUBSELECT | WSQL_TYPE_BOUNDINPUT) &&
         subSelect != nullptr)
@@ -649,8 +638,6 @@ int WSQL_Request::buildInput(WSQL_Request_t* rec) {
             RAS1_TRACE_IF(ras, RAS1_DETAIL, "Input [%d/%d] column: %-10s value: %.*s (binary %d)", i, count,
                           column != nullptr ? column : "", static_cast<int>(n), v.data, static_cast<int>(n));
         } else {
-            char expanded[kValueSize];
-            if (!useValues) value = expandDateTime(value, expanded, sizeof expanded);
             rc = select->setInputValue(i, value, static_cast<short>(-1));
             RAS1_TRACE_IF(ras, RAS1_DETAIL, "Input [%d/%d] column: %-10s value: %s", i, count,
                           column != nullptr ? column : "", value);
