@@ -6,9 +6,9 @@
 // iterator as the position stack and the parent pointers to climb back, so
 // any nesting depth the parser accepts is safe.
 //
-// Node lists (children, attributes) have no lock and are made on first use: a
-// document is used by one thread at a time, and most elements are leaves
-// without attributes.
+// Lists have no lock (a document is used by one thread at a time); a node's
+// children and attribute lists are made on first use, since most elements
+// are leaves without attributes.
 #include "kshxmlxp.h"
 
 #include <cstddef>
@@ -560,10 +560,13 @@ void KSH_DOMNode::resetAttributeListIter() {
 
 // ------------------------------------------------------------------ KSH_XML
 
+// A document and its cursors are used by one thread at a time, so its lists
+// take no lock (a lock per append and per step costs more than the rest of
+// building a leaf element).
 KSH_XML::KSH_XML()
-    : elements(new (std::nothrow) LinkedList(xmlElementDestructor)),
-      fragments(new (std::nothrow) LinkedList(xmlFragmentDestructor)),
-      arrayList(new (std::nothrow) LinkedList(nullptr)) {
+    : elements(new (std::nothrow) LinkedList(nullptr, xmlElementDestructor)),
+      fragments(new (std::nothrow) LinkedList(nullptr, xmlFragmentDestructor)),
+      arrayList(new (std::nothrow) LinkedList(nullptr, nullptr)) {
     if (arrayList) arrayIter = new (std::nothrow) LinkedListIter(arrayList);
 }
 
