@@ -295,24 +295,20 @@ int runLogout(int argc, char**) {
     return 0;
 }
 
-// Closes a module handle when the run ends.
-struct ModuleCloser {
-    void operator()(void* h) const {
-        if (h) dlclose(h);
-    }
-};
-
-CommandEntry loadCommand(const char* symbol, std::unique_ptr<void, ModuleCloser>* handle) {
+// Loads the command module and finds `symbol` in it. The module stays loaded
+// until the process ends: opcli runs one command, and the libraries under
+// the module keep process-wide caches that must stay reachable.
+CommandEntry loadCommand(const char* symbol) {
     std::string errors;
     for (const std::string& path : moduleCandidates()) {
         bool bare = path.find('/') == std::string::npos;
         if (!bare && !readable(path)) continue;
-        handle->reset(dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL));
-        if (*handle) {
-            void* sym = dlsym(handle->get(), symbol);
+        void* handle = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+        if (handle) {
+            void* sym = dlsym(handle, symbol);
             if (sym) return reinterpret_cast<CommandEntry>(sym);
             errors += path + ": no entry " + symbol + "\n";
-            handle->reset();
+            dlclose(handle);
         } else {
             const char* e = dlerror();
             errors += std::string(e ? e : path.c_str()) + "\n";
@@ -332,8 +328,7 @@ int runCreatesit(int argc, char** argv) {
         fprintf(stderr, "opcli: the session in %s is not usable; log in again\n", OPCLI_SessionDir().c_str());
     OPCLI_Context::setActive(&ctx);
 
-    std::unique_ptr<void, ModuleCloser> module;
-    CommandEntry entry = loadCommand("createsit", &module);
+    CommandEntry entry = loadCommand("createsit");
     if (!entry) return 1;
 
     // The command may trim its arguments in place: it gets copies.

@@ -76,6 +76,7 @@ TEST_F(KuiRun, OptionCombinationsAreCheckedInOrder) {
         {{"-s", "NEWSIT", "-p", "DESC=x", "-b", "BASESIT"}, "002E@S"},  // -p must be last
         {{"-s", "NEWSIT", "-b", "BASESIT", "-p"}, "002E@S"},
         {{"-s", "NEWSIT", "-b", "BASESIT", "-p", "=x"}, "002E@S"},
+        {{"-s", "NEWSIT", "-b", "BASESIT", "-p", "DESC=a", "-p", "ADVICE=b"}, "002E@S"},  // a second -p
         {{"-s", "NEWSIT", "-b", "BASESIT", "-p", "A=1", "B=2", "C=3", "D=4", "E=5", "F=6", "G=7", "H=8"}, "002E@S"},
         {{"-s", std::string(257, 'N'), "-b", "BASESIT"}, "035E@S"},
         {{"-s", "NEWSIT", "-b", std::string(257, 'B')}, "036E@S"},
