@@ -574,7 +574,8 @@ int WSQL_Request::buildUpdateSQL(WSQL_Request_t* rec) {
         valueQuoting(columnType(table, f.column), value, &prefix, &quote);
         rc = s.put("%s %s %c%c", f.column, filterOper(f.oper), prefix, quote);
         if (rc == 0) rc = quote == '"' ? s.putEscaped(value) : s.put("%s", value);
-        if (rc == 0) rc = s.put("%c %s", quote, i + 1 < rec->numFilters ? "AND" : "");
+        // "AND " with its blank: the next term must not run into it.
+        if (rc == 0) rc = s.put("%c %s", quote, i + 1 < rec->numFilters ? "AND " : "");
     }
     if (rc == 0) RAS1_TRACE_IF(ras, RAS1_STATE, "Using SQL: %s", sqlText);
     RAS1_EXIT_RC(ras, rc);

@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <deque>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -20,6 +21,7 @@
 #include "bss1/bss1.h"
 #include "kshcat.h"
 #include "kshhttp.h"
+#include "kshreqt.h"
 #include "sql1/sql1.h"
 
 namespace kshtest {
@@ -169,6 +171,63 @@ public:
 
 private:
     BSS1_Clock previous;
+};
+
+// A parsed request record whose strings the builder keeps alive.
+class Record {
+public:
+    Record() { std::memset(&r, 0, sizeof r); }
+    Record(const Record&) = delete;
+    Record& operator=(const Record&) = delete;
+
+    char* keep(const std::string& s) {
+        texts.push_back(s);
+        return texts.back().data();
+    }
+    Record& table(const std::string& t) {
+        r.table = keep(t);
+        return *this;
+    }
+    Record& column(const std::string& c) {
+        r.columns[r.numColumns++] = keep(c);
+        return *this;
+    }
+    Record& value(const std::string& c, const std::string& v) {
+        r.columns[r.numColumns++] = keep(c);
+        r.values[r.numValues++] = keep(v);
+        return *this;
+    }
+    Record& filter(const std::string& c, const std::string& op, const std::string& v, bool attr = false) {
+        WSQL_Filter_t& f = r.filters[r.numFilters++];
+        f.column = keep(c);
+        f.oper = keep(op);
+        f.value = keep(v);
+        f.isAfilter = attr ? 1 : 0;
+        return *this;
+    }
+    Record& parma(const std::string& n, const std::string& v) {
+        r.parma[r.numParma].name = keep(n);
+        r.parma[r.numParma++].value = keep(v);
+        return *this;
+    }
+    // A SOAP method request with credentials.
+    Record& soap(uint32_t methods, const char* user = "sysadmin", const char* password = "adminpw") {
+        r.type |= WSQL_TYPE_SOAP;
+        r.methods |= methods;
+        std::strncpy(r.userid, user, sizeof r.userid);
+        std::strncpy(r.password, password, sizeof r.password);
+        std::strncpy(r.clientHost, "127.0.0.1", sizeof r.clientHost);
+        return *this;
+    }
+    Record& persist() {
+        r.elements |= WSQL_ELEM_PERSIST;
+        return *this;
+    }
+
+    WSQL_Request_t r;
+
+private:
+    std::deque<std::string> texts;
 };
 
 inline int countOf(const std::string& text, const std::string& what) {
