@@ -61,26 +61,52 @@ bool nameAllowed(const char* name) {
     return true;
 }
 
-// Opens `full` for reading when it is a regular file whose real path lies
-// inside the real path of `dir`; null otherwise (missing, a directory, or a
-// link leading out).
-FILE* openInside(const char* dir, const char* full) {
-    int ras = RAS1_Sync(RAS1_THIS);
-    char* base = realpath(dir, nullptr);
-    char* real = base ? realpath(full, nullptr) : nullptr;
-    FILE* f = nullptr;
-    if (real) {
-        size_t n = strlen(base);
-        bool inside = strncmp(real, base, n) == 0 && (real[n] == '/' || (n > 0 && base[n - 1] == '/'));
-        int fd = inside ? ::open(real, O_RDONLY | O_NOFOLLOW | O_CLOEXEC) : -1;
-        struct stat st;
-        if (fd >= 0 && fstat(fd, &st) == 0 && S_ISREG(st.st_mode)) f = fdopen(fd, "rb");
-        if (!f && fd >= 0) ::close(fd);
-        if (!inside && (ras & RAS1_DETAIL)) RAS1_Printf(RAS1_THIS, __LINE__, "%s resolves outside %s", full, base);
+// The real path of `dir`, resolved once per thread (the directory is fixed
+// after start); empty when it does not resolve.
+const std::string& realDirectory(const char* dir) {
+    thread_local std::string cachedDir, cachedBase;
+    if (cachedBase.empty() || cachedDir != dir) {
+        char* resolved = realpath(dir, nullptr);
+        cachedDir = dir;
+        cachedBase = resolved ? resolved : "";
+        free(resolved);
     }
-    free(real);
-    free(base);
-    return f;
+    return cachedBase;
+}
+
+// The real path of the file open on `fd`, which is what was opened whatever
+// links led there (no window between checking and opening).
+bool openedPath(int fd, const char* full, std::string* out) {
+    char link[32], target[4096];
+    snprintf(link, sizeof link, "/proc/self/fd/%d", fd);
+    ssize_t n = readlink(link, target, sizeof target - 1);
+    if (n > 0) {
+        out->assign(target, static_cast<size_t>(n));
+        return true;
+    }
+    char* resolved = realpath(full, nullptr);  // no /proc: resolve by name
+    if (resolved) out->assign(resolved);
+    free(resolved);
+    return resolved != nullptr;
+}
+
+// Opens `full` for reading when it is a regular file whose real path lies
+// inside the real path of `dir`: the descriptor and its status, or -1
+// (missing, not a regular file, or a link leading out).
+int openInside(const char* dir, const char* full, struct stat* st) {
+    int ras = RAS1_Sync(RAS1_THIS);
+    const std::string& base = realDirectory(dir);
+    int fd = base.empty() ? -1 : ::open(full, O_RDONLY | O_CLOEXEC | O_NONBLOCK);  // a FIFO must not block us
+    std::string real;
+    if (fd >= 0 && (fstat(fd, st) != 0 || !S_ISREG(st->st_mode) || !openedPath(fd, full, &real))) real.clear();
+    bool inside = !real.empty() && real.compare(0, base.size(), base) == 0 &&
+                  (real[base.size()] == '/' || base.back() == '/');
+    if (fd >= 0 && !inside) {
+        if (!real.empty() && (ras & RAS1_DETAIL)) RAS1_Printf(RAS1_THIS, __LINE__, "%s resolves outside %s", full, base.c_str());
+        ::close(fd);
+        fd = -1;
+    }
+    return fd;
 }
 
 // The file part of a lower-cased path: from the first slash after the
@@ -110,38 +136,46 @@ void sendNotFound(WSQL_HttpServer* server, const char* name, const char* full) {
     server->writeClientBuffer();
 }
 
+// Reads up to `n` bytes (fewer only at the end of the file); -1 on error.
+ssize_t readChunk(int fd, char* p, size_t n) {
+    size_t got = 0;
+    while (got < n) {
+        ssize_t k = ::read(fd, p + got, n - got);
+        if (k < 0 && errno == EINTR) continue;
+        if (k < 0) return -1;
+        if (k == 0) break;
+        got += static_cast<size_t>(k);
+    }
+    return static_cast<ssize_t>(got);
+}
+
 // Streams an open file in chunks of the response buffer's capacity.
-void sendFile(WSQL_HttpServer* server, FILE* f, const char* name) {
+void sendFile(WSQL_HttpServer* server, int fd, const struct stat& st, const char* name) {
     int ras = RAS1_Sync(RAS1_THIS);
-    struct stat st;
-    bool known = fstat(fileno(f), &st) == 0;
     uint32_t media = WSQL_FileServer::determineMediaType(name);
     char date[40];
-    KDH1_sendhdr_struct modified = {KDH1_HDR_LASTMODIFIED, 0, date};
-    if (known) {
-        httpDate(st.st_mtime, date, sizeof date);
-        modified.length = static_cast<uint32_t>(strlen(date));
-    }
-    uint64_t size = known ? static_cast<uint64_t>(st.st_size) : 0;
+    httpDate(st.st_mtime, date, sizeof date);
+    KDH1_sendhdr_struct modified = {KDH1_HDR_LASTMODIFIED, static_cast<uint32_t>(strlen(date)), date};
+    uint64_t size = static_cast<uint64_t>(st.st_size);
     if (ras & RAS1_DETAIL) RAS1_Printf(RAS1_THIS, __LINE__, "Serving file: %s, size=%d, media=%d", name, (int)size, (int)media);
-    server->writeHeaders(KDH1_STC_OK, media, size, known ? 1 : 0, known ? &modified : nullptr);
+    server->writeHeaders(KDH1_STC_OK, media, size, 1, &modified);
 
     WSQL_ResponseBuffer* b = server->getBuffer();
     b->clear();
     char* chunk = b->getBuffer();
     const size_t capacity = b->getMaxLength();
     for (;;) {
-        size_t n = fread(chunk, 1, capacity, f);
-        if (n == 0) break;
-        bool full = n == capacity;
-        int rc = server->writeClient(chunk, n);
+        ssize_t n = readChunk(fd, chunk, capacity);
+        if (n < 0) RAS1_Printf(RAS1_THIS, __LINE__, "Error reading %s - %d - %s", name, errno, strerror(errno));
+        if (n <= 0) break;
+        bool full = static_cast<size_t>(n) == capacity;
+        int rc = server->writeClient(chunk, static_cast<size_t>(n));
         if (ras & RAS1_DETAIL)
             RAS1_Printf(RAS1_THIS, __LINE__, full ? "file: %s Sent %d bytes" : "finished file: %s Sent %d bytes", name,
                         (int)n);
         // A client that is gone takes no more: stop reading.
         if (!full || rc != 0) break;
     }
-    if (ferror(f)) RAS1_Printf(RAS1_THIS, __LINE__, "Error reading %s - %d - %s", name, errno, strerror(errno));
     chunk[0] = '\0';
     b->clear();
 }
@@ -198,10 +232,11 @@ int WSQL_FileServer::serveFile(WSQL_HttpServer* server, const char* serviceName)
                 server->returnError(kNoMemoryStatus, "Unable to allocate memory for filename.", 0);
             } else {
                 snprintf(full, size, "%s/%s", dir, name);
-                FILE* f = server->getBuffer() || server->setBuffer(0) == 0 ? openInside(dir, full) : nullptr;
-                if (f) {
-                    sendFile(server, f, name);
-                    fclose(f);
+                struct stat st;
+                int fd = server->getBuffer() || server->setBuffer(0) == 0 ? openInside(dir, full, &st) : -1;
+                if (fd >= 0) {
+                    sendFile(server, fd, st, name);
+                    ::close(fd);
                 } else if (!server->getBuffer()) {
                     server->returnError(kNoMemoryStatus, "Unable to obtain memory.", 0);
                 } else {

@@ -175,7 +175,7 @@ struct KDH1_limits_struct {
     size_t maxEntity;            // request body bytes; larger: 413 (8 MiB)
     unsigned connectionLimit;    // open connections (512)
     unsigned connectionTimeout;  // seconds a connection may stay idle (60)
-    size_t connectionMemory;     // bytes of buffer per connection (256 KiB)
+    size_t connectionMemory;     // bytes of buffer per connection (48 KiB, at least 40; cleared per request)
     unsigned networkThreads;     // network threads (the number of cores)
     unsigned maxWorkers;         // threads running callbacks at once (64)
     size_t streamBuffer;         // body bytes held between KDH1_Put and the client (256 KiB)

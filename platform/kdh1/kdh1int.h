@@ -31,6 +31,9 @@
 
 namespace kdh1 {
 
+// Returns a stream buffer to the layer's pool (or frees it); null is ignored.
+void giveBuffer(void* buffer);
+
 struct Service {
     KDH1_server_t id = 0;
     std::string name;
@@ -55,7 +58,7 @@ struct KDH1_Request {
     KDH1_Request(const KDH1_Request&) = delete;
     KDH1_Request& operator=(const KDH1_Request&) = delete;
     KDH1_Request(MHD_Connection* c, const char* uri) : conn(c), target(uri ? uri : "") {}
-    ~KDH1_Request() { free(buf); }
+    ~KDH1_Request() { kdh1::giveBuffer(buf); }
 
     // Fixed before the callback runs; read without the lock.
     MHD_Connection* conn;
@@ -86,7 +89,7 @@ struct KDH1_Request {
     uint64_t accepted = 0;       // body bytes taken by KDH1_Put
     uint64_t sent = 0;           // body bytes handed to the engine
     uint32_t options = 0;        // activity option set 4
-    char* buf = nullptr;         // stream buffer, bytes [rd, wr) pending
+    char* buf = nullptr;         // stream buffer (pooled, cap bytes), bytes [rd, wr) pending
     size_t rd = 0, wr = 0, cap = 0;
     bool producerDone = false;   // the callback has returned
     bool cancelled = false;      // client gone, stalled or service deleted
@@ -124,7 +127,7 @@ Layer& layer();
 KDH1_limits_struct effectiveLimits(const KDH1_limits_struct& set);
 
 // Bytes pending before a parked request is woken to send them.
-constexpr size_t kWakeBytes = 64 * 1024;
+constexpr size_t kWakeBytes = 128 * 1024;
 // Milliseconds pending bytes may wait in a parked request before the watchdog
 // sends them anyway (a producer that pauses between small writes).
 constexpr long long kFlushMillis = 20;

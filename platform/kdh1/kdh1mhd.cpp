@@ -21,7 +21,7 @@ using namespace kdh1;
 namespace {
 
 // Bytes the engine asks for per read of a streamed body.
-constexpr size_t kBlockSize = 32 * 1024;
+constexpr size_t kBlockSize = 16 * 1024;
 
 struct MethodEntry {
     const char* name;
@@ -235,7 +235,7 @@ MHD_Response* buildResponseLocked(KDH1_Request* r, unsigned* http) {
     bool whole = r->producerDone && (r->contentLength == 0 || r->accepted == r->contentLength);
     MHD_Response* resp = nullptr;
     if (whole && pending > 0 && r->rd == 0) {
-        resp = MHD_create_response_from_buffer(pending, r->buf, MHD_RESPMEM_MUST_FREE);
+        resp = MHD_create_response_from_buffer_with_free_callback(pending, r->buf, giveBuffer);
         if (resp) {
             r->buf = nullptr;
             r->rd = r->wr = r->cap = 0;

@@ -6,6 +6,8 @@
 #include <algorithm>
 #include <cstdlib>
 #include <cstring>
+#include <mutex>
+#include <vector>
 
 #include "bss1/bss1.h"
 #include "kdh1/kdh1int.h"
@@ -74,23 +76,52 @@ const HeaderEntry kHeaders[] = {
     {KDH1_HDR_CACHE, "Cache-Control", true},
 };
 
-// Grows the stream buffer so that `need` more bytes fit after wr, at most to
-// the request's limit; the pending bytes move to the front first.
-// REQUIRES: r->mu held.
+// Stream buffers are all of the listener's stream-buffer size and are
+// reused: allocating and freeing them per request (often on different
+// threads) costs more than the copying they serve.
+struct BufferPool {
+    std::mutex mu;
+    std::vector<char*> free;  // guarded by mu
+    size_t size = 0;          // guarded by mu; size of every pooled buffer
+};
+BufferPool& bufferPool() {
+    static BufferPool* p = new BufferPool;  // never destroyed: buffers may come back at exit
+    return *p;
+}
+constexpr size_t kPooledBuffers = 32;
+
+char* takeBuffer(size_t size) {
+    BufferPool& P = bufferPool();
+    {
+        std::lock_guard<std::mutex> g(P.mu);
+        if (P.size != size) {
+            for (char* b : P.free) ::free(b);
+            P.free.clear();
+            P.size = size;
+        }
+        if (!P.free.empty()) {
+            char* b = P.free.back();
+            P.free.pop_back();
+            return b;
+        }
+    }
+    return static_cast<char*>(malloc(size));
+}
+
+// Makes room for `need` more bytes after wr: the pending bytes move to the
+// front. REQUIRES: r->mu held; need <= limit - pending.
 bool makeRoom(KDH1_Request* r, size_t need, size_t limit) {
-    if (r->rd > 0) {
+    if (!r->buf) {
+        r->buf = takeBuffer(limit);
+        if (!r->buf) return false;
+        r->cap = limit;
+    }
+    if (r->wr + need > r->cap && r->rd > 0) {
         memmove(r->buf, r->buf + r->rd, r->wr - r->rd);
         r->wr -= r->rd;
         r->rd = 0;
     }
-    if (r->wr + need <= r->cap) return true;
-    size_t want = std::max<size_t>(r->cap ? r->cap * 2 : 16 * 1024, r->wr + need);
-    want = std::min(want, limit);
-    char* grown = static_cast<char*>(realloc(r->buf, want));
-    if (!grown) return false;
-    r->buf = grown;
-    r->cap = want;
-    return true;
+    return r->wr + need <= r->cap;
 }
 
 }  // namespace
@@ -131,6 +162,19 @@ uint32_t mediaOfContentType(const char* contentType) {
                 return table[i].media;
     }
     return KDH1_MEDIA_OTHER;
+}
+
+void giveBuffer(void* buffer) {
+    if (!buffer) return;
+    BufferPool& P = bufferPool();
+    {
+        std::lock_guard<std::mutex> g(P.mu);
+        if (P.free.size() < kPooledBuffers) {
+            P.free.push_back(static_cast<char*>(buffer));
+            return;
+        }
+    }
+    ::free(buffer);
 }
 
 void release(KDH1_Request* r) {

@@ -218,13 +218,21 @@ uint32_t startListenerLocked(Layer& L) {
     if (fd < 0) return KDH1_STC_LISTENFAILED;
     pool().max = L.running.maxWorkers;
     unsigned flags = MHD_USE_INTERNAL_POLLING_THREAD | MHD_USE_EPOLL | MHD_ALLOW_SUSPEND_RESUME | MHD_USE_ERROR_LOG;
-    MHD_Daemon* d = MHD_start_daemon(
-        flags, 0, nullptr, nullptr, accessCallback, nullptr, MHD_OPTION_EXTERNAL_LOGGER, engineLog, nullptr,
-        MHD_OPTION_LISTEN_SOCKET, fd, MHD_OPTION_THREAD_POOL_SIZE, (unsigned)L.running.networkThreads,
-        MHD_OPTION_CONNECTION_LIMIT, (unsigned)L.running.connectionLimit, MHD_OPTION_CONNECTION_TIMEOUT,
-        (unsigned)L.running.connectionTimeout, MHD_OPTION_CONNECTION_MEMORY_LIMIT, (size_t)L.running.connectionMemory,
-        MHD_OPTION_URI_LOG_CALLBACK, uriCallback, nullptr, MHD_OPTION_NOTIFY_COMPLETED, completedCallback, nullptr,
-        MHD_OPTION_END);
+    // One network thread runs without a pool (the engine refuses a pool of 1).
+    unsigned threads = L.running.networkThreads;
+    MHD_OptionItem options[] = {
+        {MHD_OPTION_EXTERNAL_LOGGER, (intptr_t)engineLog, nullptr},
+        {MHD_OPTION_LISTEN_SOCKET, fd, nullptr},
+        {MHD_OPTION_CONNECTION_LIMIT, (intptr_t)L.running.connectionLimit, nullptr},
+        {MHD_OPTION_CONNECTION_TIMEOUT, (intptr_t)L.running.connectionTimeout, nullptr},
+        {MHD_OPTION_CONNECTION_MEMORY_LIMIT, (intptr_t)L.running.connectionMemory, nullptr},
+        {MHD_OPTION_URI_LOG_CALLBACK, (intptr_t)uriCallback, nullptr},
+        {MHD_OPTION_NOTIFY_COMPLETED, (intptr_t)completedCallback, nullptr},
+        {threads > 1 ? MHD_OPTION_THREAD_POOL_SIZE : MHD_OPTION_END, (intptr_t)threads, nullptr},
+        {MHD_OPTION_END, 0, nullptr},
+    };
+    MHD_Daemon* d = MHD_start_daemon(flags, 0, nullptr, nullptr, accessCallback, nullptr, MHD_OPTION_ARRAY, options,
+                                     MHD_OPTION_END);
     if (!d) {
         RAS1_Printf(RAS1_THIS, __LINE__, "HTTP engine did not start on %s:%d", L.address.c_str(), bound);
         close(fd);
@@ -290,9 +298,9 @@ KDH1_limits_struct effectiveLimits(const KDH1_limits_struct& set) {
     if (!e.maxEntity) e.maxEntity = 8u << 20;
     if (!e.connectionLimit) e.connectionLimit = 512;
     if (!e.connectionTimeout) e.connectionTimeout = 60;
-    if (!e.connectionMemory) e.connectionMemory = 256u << 10;
+    if (!e.connectionMemory) e.connectionMemory = 48u << 10;
     // The engine needs room for the headers and one stream block.
-    if (e.connectionMemory < 64u << 10) e.connectionMemory = 64u << 10;
+    if (e.connectionMemory < 40u << 10) e.connectionMemory = 40u << 10;
     if (!e.networkThreads) e.networkThreads = static_cast<unsigned>(cores);
     if (!e.maxWorkers) e.maxWorkers = 64;
     if (!e.streamBuffer) e.streamBuffer = 256u << 10;
@@ -341,6 +349,7 @@ void submit(KDH1_Request* r) {
             }
         }
     }
+    g.unlock();  // the woken worker should not find the lock still taken
     P.cv.notify_one();
 }
 
