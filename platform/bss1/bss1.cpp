@@ -62,14 +62,24 @@ void BSS1_Sleep(unsigned millis) {
     }
 }
 
+namespace {
+// Copies at most size-1 bytes of src and terminates dst; a longer name is cut.
+template <size_t N>
+void copyField(char (&dst)[N], const char* src) {
+    size_t n = strnlen(src, N - 1);
+    memcpy(dst, src, n);
+    dst[n] = '\0';
+}
+}  // namespace
+
 int BSS1_Info(BSS1_HostInfo* info) {
     memset(info, 0, sizeof *info);
     struct utsname u;
     if (uname(&u) != 0) return 8;
-    snprintf(info->hostName, sizeof info->hostName, "%s", u.nodename);
-    snprintf(info->systemName, sizeof info->systemName, "%s", u.sysname);
-    snprintf(info->release, sizeof info->release, "%s", u.release);
-    snprintf(info->machine, sizeof info->machine, "%s", u.machine);
+    copyField(info->hostName, u.nodename);
+    copyField(info->systemName, u.sysname);
+    copyField(info->release, u.release);
+    copyField(info->machine, u.machine);
     long cpus = sysconf(_SC_NPROCESSORS_ONLN);
     info->cpuCount = cpus > 0 ? (int)cpus : 1;
     info->processId = (long)getpid();
