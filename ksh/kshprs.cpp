@@ -24,7 +24,7 @@ RAS1_UNIT("kshprs");
 const WSQL_Action actions[] = {
     {"start", WSQL_StartRequest},  {"login", WSQL_LMS_Login},    {"insert", WSQL_StartRequest},
     {"delete", WSQL_StartRequest}, {"update", WSQL_StartRequest}, {"events", WSQL_StartRequest},
-    {nullptr, nullptr},
+    {"addhub", WSQL_AddHub},       {"delhub", WSQL_DeleteHub},    {nullptr, nullptr},
 };
 
 namespace {

@@ -100,8 +100,19 @@ int WSQL_SetupGetMethod(WSQL_HttpServer* http, WSQL_Request_t* req);
 // a request without both items (nothing is written).
 int WSQL_LMS_Login(WSQL_HttpServer* http, WSQL_Hub* hub);
 
-// The hub a request names by its alias (ignoring case), or null when no hub
-// has that alias. `defaultHub` is the hub the request arrived at.
+// Query action "addhub": adds the hub named by the items "lmsname",
+// "servicename", "aliasname" (and "portno", the qualifier, when not empty)
+// to the gateway and its hub list file, then serves the requested file.
+// Query action "delhub": removes the hubs listed by the item "DelHubList"
+// ("#2#5") from the hub list file, then serves the requested file. Both
+// answer with the page "Unable to start request." when items are missing
+// (code 1) or the hub list cannot be changed (the failure status); 0 or 1.
+int WSQL_AddHub(WSQL_HttpServer* http, WSQL_Hub* hub);
+int WSQL_DeleteHub(WSQL_HttpServer* http, WSQL_Hub* hub);
+
+// The hub a request names by its alias (ignoring case) in the gateway's hub
+// list, or null when no hub has that alias. `defaultHub` is the hub the
+// request arrived at.
 WSQL_Hub* WSQL_ResolveHubAlias(const char* alias, WSQL_Hub* defaultHub);
 
 // Runs the special method selected by `methods` (CT_Affinity, CT_EMail,

@@ -576,3 +576,57 @@ TEST_F(KshPrs, HubThatCannotBeReachedOrTakeNationalTextIsRefused) {
     EXPECT_EQ(old->fault(), "HUB Version is incompatible.");
     EXPECT_EQ(old->detail(), lms);
 }
+
+TEST_F(KshPrs, HubListActionsRewriteTheHubFileOrAnswerWithTheErrorPage) {
+    const std::string hubs = dir + "/kshxhubs.xml";
+    std::ofstream(hubs) << "<ENTERPRISE>\n<HUB>\n<Alias>one</Alias>\n<LMS_Name>L1</LMS_Name>\n</HUB>\n\n"
+                           "<HUB>\n<Alias>two</Alias>\n<LMS_Name>L2</LMS_Name>\n</HUB>\n\n"
+                           "<HUB>\n<Alias>three</Alias>\n<LMS_Name>L3</LMS_Name>\n</HUB>\n</ENTERPRISE>\n";
+    auto del = get("action=delhub&DelHubList=%232");
+    EXPECT_EQ(lastRc, 0);
+    EXPECT_TRUE(contains(del->sent, "front page")) << del->sent;
+    std::stringstream now;
+    now << std::ifstream(hubs).rdbuf();
+    EXPECT_FALSE(contains(now.str(), "two"));
+    EXPECT_TRUE(contains(now.str(), "one") && contains(now.str(), "three")) << now.str();
+
+    // Without a usable list, or without the three names, nothing changes.
+    for (const char* q : {"action=delhub&DelHubList=abc", "action=delhub", "action=addhub&lmsname=L4&aliasname=four",
+                          "action=addhub&lmsname=L4&servicename=&aliasname=four"}) {
+        auto bad = get(q);
+        EXPECT_EQ(lastRc, 1) << q;
+        EXPECT_TRUE(contains(bad->sent, "<TD>25</TD><TD>1</TD><TD>Unable to start request.</TD>")) << q;
+        std::stringstream after;
+        after << std::ifstream(hubs).rdbuf();
+        EXPECT_EQ(after.str(), now.str()) << q;
+    }
+}
+
+TEST_F(KshPrs, PersistedRequestIsResumedByItsHandle) {
+    const std::string select = "<table>O4SRV.TSITDESC</table><column>SITNAME</column>" + creds();
+    auto first = post(soapEnvelope("<CT_Get persist=\"yes\">" + select + "<filter>SITNAME;EQ;ZAG_CPU_Busy</filter>"
+                                   "</CT_Get>"));
+    EXPECT_EQ(lastRc, 0) << first->fault();
+    std::string body = soapBody(*first);
+    size_t at = body.find("handle=\"");
+    ASSERT_NE(at, std::string::npos) << body;
+    std::string handle = body.substr(at + 8, body.find('"', at + 8) - at - 8);
+    EXPECT_TRUE(contains(body, "<SITNAME>ZAG_CPU_Busy</SITNAME>"));
+
+    // The filter was bound: a resume must bring new values, which select
+    // another row through the same statement.
+    auto bare = post(soapEnvelope("<CT_Get handle=\"" + handle + "\">" + select + "</CT_Get>"));
+    EXPECT_EQ(bare->fault(), "Invalid or missing updates to resume request.");
+    auto again = post(soapEnvelope("<CT_Get handle=\"" + handle + "\">" + select +
+                                   "<filter>SITNAME;EQ;ZAG_Disk_Full</filter></CT_Get>"));
+    EXPECT_EQ(lastRc, 0) << again->fault();
+    body = soapBody(*again);
+    EXPECT_TRUE(contains(body, "<SITNAME>ZAG_Disk_Full</SITNAME>")) << body;
+    EXPECT_FALSE(contains(body, "ZAG_CPU_Busy"));
+    EXPECT_TRUE(sqlSent().size() == 1);  // built once, at the first request
+
+    // A handle nobody issued starts a new request.
+    auto unknown = post(soapEnvelope("<CT_Get handle=\"999999\">" + select + "</CT_Get>"));
+    EXPECT_EQ(lastRc, 0) << unknown->fault();
+    EXPECT_TRUE(contains(soapBody(*unknown), "<SITNAME>ZAG_Disk_Full</SITNAME>"));
+}
