@@ -2,8 +2,11 @@
 // kshdhtpsvc.h).
 #include "kshdhtpsvc.h"
 
+#include <chrono>
+#include <condition_variable>
 #include <cstdio>
 #include <cstring>
+#include <mutex>
 
 #include "bss1/bss1.h"
 #include "kshanchor.h"
@@ -11,16 +14,13 @@
 #include "kshfile.h"
 #include "kshhub.h"
 #include "kshlst.h"
+#include "kshprs.h"
 #include "kshssrv.h"
 #include "pfm1/pfm1.h"
 #include "ras1/ras1.h"
 #include "wsql_rc.h"
 
 RAS1_UNIT("kshdhtpsvc");
-
-// Until the request parsers are part of the build, their routes are skipped.
-int WSQL_ParseRequest(WSQL_HttpServer* server, WSQL_Hub* hub) __attribute__((weak));
-int WSQL_ParsePostRequest(WSQL_HttpServer* server, WSQL_Hub* hub) __attribute__((weak));
 
 namespace {
 
@@ -50,6 +50,29 @@ public:
     ServiceGuard& operator=(const ServiceGuard&) = delete;
 };
 
+// The HTTP layer hands a request whose path names no service to the service
+// created first. That must be the local hub's ("soap"), so its thread is
+// started first and the others only once it has created its service (or
+// failed to). The wait is bounded: a stuck thread delays the others only.
+constexpr int kFirstServiceWaitMillis = 5000;
+struct FirstService {
+    std::mutex mu;
+    std::condition_variable cond;
+    WSQL_Hub* awaited = nullptr;  // GUARDED_BY(mu)
+    bool created = false;         // GUARDED_BY(mu)
+};
+FirstService& firstService() {
+    static FirstService f;
+    return f;
+}
+void serviceCreated(WSQL_Hub* hub) {
+    FirstService& f = firstService();
+    std::lock_guard<std::mutex> held(f.mu);
+    if (f.awaited != hub) return;
+    f.created = true;
+    f.cond.notify_all();
+}
+
 void hubThreadBody(void* hub) { (void)WSQL_KDH_StartServer(static_cast<WSQL_Hub*>(hub)); }
 
 // Starts the service thread of `hub`. REQUIRES: the service lock.
@@ -63,6 +86,25 @@ int startHubThread(WSQL_Hub* hub) {
     }
     hub->setThreadID(thread);
     return WSQL_OK;
+}
+
+// Starts the local hub's thread and waits until it has created its service.
+// REQUIRES: the service lock (the thread does not need it to create the
+// service).
+void startLocalHubFirst(WSQL_Hub* local) {
+    FirstService& f = firstService();
+    std::unique_lock<std::mutex> held(f.mu);
+    f.awaited = local;
+    f.created = false;
+    held.unlock();
+    if (startHubThread(local) == WSQL_OK) {
+        held.lock();
+        if (!f.cond.wait_for(held, std::chrono::milliseconds(kFirstServiceWaitMillis), [&f] { return f.created; }))
+            RAS1_Printf(RAS1_THIS, __LINE__, "Hub %s has not created its service yet", local->getAliasName());
+        held.unlock();
+    }
+    held.lock();
+    f.awaited = nullptr;
 }
 
 // Records the new service in the hub unless the gateway is stopping: then
@@ -79,6 +121,7 @@ int serveHub(WSQL_Hub* hub) {
     int ras = RAS1_Sync(RAS1_THIS);
     KDH1_server_t server = 0;
     int rc = static_cast<int>(KDH1_New(&server, hub->getServiceName(), default_service, hub, 0, 0));
+    serviceCreated(hub);
     if (rc != WSQL_OK) {
         RAS1_Printf(RAS1_THIS, __LINE__, "Unable to create the service %s for hub %s, status %x", hub->getServiceName(),
                     hub->getAliasName(), static_cast<unsigned>(rc));
@@ -110,7 +153,7 @@ struct Route {
     const char* name;
 };
 // Searched in order; the last entry takes every request.
-const Route kRoutes[] = {
+constexpr Route kRoutes[] = {
     {isPost, WSQL_ParsePostRequest, "SOAP"},
     {isAction, WSQL_ParseRequest, "URL"},
     {always, serveFile, "file"},
@@ -122,7 +165,7 @@ int routeRequest(KDH1_request_struct* request, WSQL_Hub* hub, const char** pathI
     const char* method = server.getRequestMethod();
     const char* query = server.getQueryString();
     for (const Route& r : kRoutes) {
-        if (r.handler == nullptr || !r.matches(method, query)) continue;
+        if (!r.matches(method, query)) continue;
         int ras = RAS1_Sync(RAS1_THIS);
         if (ras & RAS1_DETAIL) RAS1_Printf(RAS1_THIS, __LINE__, "%s %s goes to the %s handler", method, *pathInfo, r.name);
         return r.handler(&server, hub);
@@ -165,8 +208,16 @@ int WSQL_KDH_StartServers() {
     RAS1_ENTRY(ras);
     ServiceGuard held;
     if (gHubList != nullptr) {
+        WSQL_Hub* local = nullptr;
+        {
+            LinkedListIter it(gHubList);
+            for (void* v = it.Next(); v != nullptr && local == nullptr; v = it.Next())
+                if (std::strcmp(static_cast<WSQL_Hub*>(v)->getServiceName(), "soap") == 0) local = static_cast<WSQL_Hub*>(v);
+        }
+        if (local != nullptr) startLocalHubFirst(local);
         LinkedListIter it(gHubList);
-        for (void* v = it.Next(); v != nullptr; v = it.Next()) (void)startHubThread(static_cast<WSQL_Hub*>(v));
+        for (void* v = it.Next(); v != nullptr; v = it.Next())
+            if (v != local) (void)startHubThread(static_cast<WSQL_Hub*>(v));
     }
     RAS1_EXIT_RC(ras, 0);
     return WSQL_OK;
@@ -266,8 +317,9 @@ LinkedList* WSQL_KDH_JoinServers(int* joined) {
             thread = static_cast<BSS1_Thread*>(hub->getThreadID());
             hub->setThreadID(nullptr);
         }
-        RAS1_Printf(RAS1_THIS, __LINE__, "Waiting for hub %.255s %.255s termination.", hub->getAliasName(),
-                    hub->getLMSName());
+        if (ras & RAS1_STATE)
+            RAS1_Printf(RAS1_THIS, __LINE__, "Waiting for hub %.255s %.255s termination.", hub->getAliasName(),
+                        hub->getLMSName());
         (void)BSS1_JoinThread(thread);
         if (ras & RAS1_STATE)
             RAS1_Printf(RAS1_THIS, __LINE__, "Hub %.255s %.255s terminated.", hub->getAliasName(), hub->getLMSName());

@@ -57,6 +57,7 @@ void initializeFacilities() {
 }
 
 int mainRoutine(WSQL_Anchor* anchor) {
+    int ras = RAS1_Sync(RAS1_THIS);
     WSQL_SetFileDirectory(BSS1_GetEnv("KSH_DIRECTORY", "HTML"));
     gAnchor = anchor;
     if (anchor != nullptr) computeStackSize(anchor);
@@ -73,7 +74,7 @@ int mainRoutine(WSQL_Anchor* anchor) {
     if (hubs == nullptr || hubs->NumEntries() == 0) {
         RAS1_Printf(RAS1_THIS, __LINE__, "Error : No hubs on hub list");
     } else {
-        RAS1_Printf(RAS1_THIS, __LINE__, "%d hubs have been terminated.", joined);
+        if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "%d hubs have been terminated.", joined);
     }
     delete hubs;
     return WSQL_OK;
@@ -81,9 +82,10 @@ int mainRoutine(WSQL_Anchor* anchor) {
 
 // Ends the main routine: a later start in this process begins afresh.
 void finishMainRoutine(WSQL_Anchor* anchor) {
+    int ras = RAS1_Sync(RAS1_THIS);
     WSQL_KDH_ResetStop();
     gAnchor = nullptr;
-    RAS1_Printf(RAS1_THIS, __LINE__, "main thread is terminating");
+    if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "main thread is terminating");
     // Every mode with an anchor posts the completion event, so that stopServer
     // can wait for the end whatever the mode.
     if (anchor == nullptr || (anchor->flags & WSQL_ANCHOR_EMBEDDED) == 0) BSS1_Sleep(5);
@@ -187,7 +189,8 @@ int stopServer(WSQL_Anchor* anchor) {
     int rc = WSQL_OK;
     if (anchor != nullptr) {
         rc = WSQL_WaitEvent(&anchor->completion, kStopWaitMillis, nullptr);
-        RAS1_Printf(RAS1_THIS, __LINE__, "Wait Complete for Server main thread rc = %d", rc);
+        if (rc != WSQL_OK || (ras & RAS1_STATE))
+            RAS1_Printf(RAS1_THIS, __LINE__, "Wait Complete for Server main thread rc = %d", rc);
     }
     RAS1_EXIT_RC(ras, rc);
     return rc;
