@@ -94,6 +94,17 @@ int WSQL_SignalEvent::wait(int* code) {
     return WAIT_OK;
 }
 
+int WSQL_SignalEvent::waitMarked(int* code, std::atomic<uint32_t>& word, uint32_t bit) {
+    std::unique_lock<std::mutex> l(mu);
+    word.fetch_or(bit);
+    cond.wait(l, [this] { return signaled != 0; });
+    word.fetch_and(~bit);
+    if (code != nullptr) *code = code_;
+    code_ = 0;
+    signaled = 0;
+    return WAIT_OK;
+}
+
 int WSQL_SignalEvent::waitUntil(long long deadlineMillis, int* code) {
     std::unique_lock<std::mutex> l(mu);
     int rc = WAIT_OK;
@@ -411,11 +422,13 @@ WSQL_Request::WSQL_Request(WSQL_Hub* h, WSQL_HttpServer* server)
 WSQL_Request::~WSQL_Request() {
     int ras = RAS1_Sync(RAS1_THIS);
     RAS1_ENTRY(ras);
-    state.fetch_and(~STATE_ACTIVE);
     {
+        // Out of the list before the active bit goes: an expiry pass must
+        // never see this request inactive and delete it a second time.
         std::lock_guard<std::recursive_mutex> g(gListMutex);
         if (alias != 0) (void)ANC1_Release(alias);
         if (gRequestList != nullptr) (void)gRequestList->RemoveEntry(this);
+        state.fetch_and(~STATE_ACTIVE);
     }
     // Out of the list: a stop waiting for this cancelled request may go on
     // while the statements are released below.

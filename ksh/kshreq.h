@@ -97,6 +97,10 @@ public:
     void signalLocked(int code);
     // Waits untimed.
     int wait(int* code);
+    // Waits untimed with `bit` set in `word` for exactly as long as the
+    // wait lasts (set and cleared under the mutex, so whoever looks at the
+    // bit under the mutex sees a waiter that has not been woken yet).
+    int waitMarked(int* code, std::atomic<uint32_t>& word, uint32_t bit);
     // Waits until `deadlineMillis` of BSS1_MonotonicMillis().
     int waitUntil(long long deadlineMillis, int* code);
     bool posted();

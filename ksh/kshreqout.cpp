@@ -459,13 +459,8 @@ int WSQL_Request::waitForOpen() {
     char d[160];
     describe(d, sizeof d);
     RAS1_TRACE_IF(ras, RAS1_STATE, "Request waiting... %s", d);
-    {
-        std::lock_guard<std::mutex> g(completion.mutex());
-        state.fetch_or(STATE_WAITING);
-    }
     int code = 0;
-    (void)completion.wait(&code);
-    state.fetch_and(~STATE_WAITING);
+    (void)completion.waitMarked(&code, state, STATE_WAITING);
     RAS1_TRACE_IF(ras, RAS1_STATE, "Request signaled  status=%d %s", code, d);
     return code;
 }
@@ -530,8 +525,9 @@ int WSQL_Request::writeRows(const char* action, bool echoItems) {
                     text = s2 != nullptr ? s2 + 1 : "";
                 }
                 if (!isXmlName(tag.c_str())) continue;
+                // As in PARMS, the SQL text itself is not echoed.
                 (void)http->append(("<" + tag + ">").c_str());
-                (void)http->appendText(text.c_str());
+                if (std::strcmp(name, "sql") != 0) (void)http->appendText(text.c_str());
                 (void)http->append(("</" + tag + ">").c_str());
             }
         }
