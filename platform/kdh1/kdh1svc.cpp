@@ -26,6 +26,7 @@ namespace {
 constexpr size_t kMaxName = 63;
 constexpr long long kWatchdogTickMillis = 25;
 constexpr unsigned kPeerCheckTicks = 40;  // every second
+constexpr int kSpinMicros = 50;
 
 // Worker threads. They are started as requests need them, up to the
 // listener's maxWorkers, and kept until the listener stops: a thread per
@@ -37,6 +38,8 @@ struct Pool {
     std::deque<KDH1_Request*> jobs;  // guarded by mu
     std::vector<std::thread> threads;  // guarded by mu
     size_t idle = 0;                   // guarded by mu
+    std::atomic<size_t> queued{0};     // jobs.size(), readable without mu
+    std::atomic<size_t> spinning{0};   // workers looking for work before they sleep
     bool stop = false;                 // guarded by mu
     size_t max = 64;
 };
@@ -94,10 +97,29 @@ void runJob(KDH1_Request* r) {
     release(r);
 }
 
+// Looks for a job for a short while before the worker goes to sleep: under
+// load the next job comes within microseconds, and taking it this way spares
+// the wake-up of a sleeping thread, which costs more than the spin.
+bool spinForJob(Pool& P) {
+    auto until = std::chrono::steady_clock::now() + std::chrono::microseconds(kSpinMicros);
+    while (P.queued.load(std::memory_order_relaxed) == 0) {
+        for (int i = 0; i < 64; i++) __builtin_ia32_pause();
+        if (std::chrono::steady_clock::now() >= until) return false;
+    }
+    return true;
+}
+
 void workerMain() {
     Pool& P = pool();
     std::unique_lock<std::mutex> g(P.mu);
     for (;;) {
+        if (P.jobs.empty() && !P.stop) {
+            P.spinning++;
+            g.unlock();
+            spinForJob(P);
+            P.spinning--;  // before the lock: submit then sees this worker as not spinning
+            g.lock();
+        }
         while (P.jobs.empty() && !P.stop) {
             P.idle++;
             P.cv.wait(g);
@@ -106,6 +128,7 @@ void workerMain() {
         if (P.jobs.empty()) return;
         KDH1_Request* r = P.jobs.front();
         P.jobs.pop_front();
+        P.queued = P.jobs.size();
         g.unlock();
         runJob(r);
         g.lock();
@@ -335,7 +358,8 @@ void submit(KDH1_Request* r) {
     Pool& P = pool();
     std::unique_lock<std::mutex> g(P.mu);
     P.jobs.push_back(r);
-    if (P.jobs.size() > P.idle && P.threads.size() < P.max) {
+    P.queued = P.jobs.size();
+    if (P.jobs.size() > P.idle + P.spinning && P.threads.size() < P.max) {
         try {
             P.threads.emplace_back(workerMain);
             return;
@@ -349,8 +373,9 @@ void submit(KDH1_Request* r) {
             }
         }
     }
+    bool taken = P.jobs.size() <= P.spinning;  // a spinning worker will take it
     g.unlock();  // the woken worker should not find the lock still taken
-    P.cv.notify_one();
+    if (!taken) P.cv.notify_one();
 }
 
 }  // namespace kdh1
