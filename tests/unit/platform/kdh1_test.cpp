@@ -1,7 +1,11 @@
 // The HTTP service layer, driven by real HTTP clients on loopback.
 #include "kdh1/kdh1.h"
 
+#include <arpa/inet.h>
 #include <curl/curl.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -257,6 +261,29 @@ TEST(Kdh1Routing, ServicesAreUniqueByNameAndDeleteEndsListen) {
     Listening again("one", [](KDH1_request_struct* r) { return answerText(r, "again"); });
     EXPECT_EQ(again.newStatus(), 0u);
     EXPECT_EQ(fetch(url("/one")).body, "again");
+}
+
+TEST(Kdh1Routing, AListenerThatCannotBindFailsAtOnce) {
+    int fd = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in sa{};
+    sa.sin_family = AF_INET;
+    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&sa), sizeof sa), 0);
+    ASSERT_EQ(listen(fd, 1), 0);
+    socklen_t len = sizeof sa;
+    getsockname(fd, reinterpret_cast<sockaddr*>(&sa), &len);
+    ASSERT_EQ(KDH1_SetListenAddress("127.0.0.1", ntohs(sa.sin_port)), 0u);
+    KDH1_server_t s = 0;
+    ASSERT_EQ(KDH1_New(&s, "taken", trampoline, nullptr, 0, 0), 0u);
+    EXPECT_EQ(KDH1_Listen(s, 0), KDH1_STC_LISTENFAILED);
+    EXPECT_EQ(KDH1_Delete(s), KDH1_STC_OK);
+    close(fd);
+    EXPECT_EQ(KDH1_SetListenAddress("no such host.invalid", 0), 0u);
+    ASSERT_EQ(KDH1_New(&s, "taken", trampoline, nullptr, 0, 0), 0u);
+    EXPECT_EQ(KDH1_Listen(s, 0), KDH1_STC_LISTENFAILED);
+    KDH1_Delete(s);
+    EXPECT_EQ(KDH1_SetListenAddress("127.0.0.1", 70000), KDH1_STC_BADARG);
+    EXPECT_EQ(KDH1_SetListenAddress("127.0.0.1", 0), 0u);
 }
 
 TEST(Kdh1Response, StatusesMediaTypesAndExtraHeadersAreSent) {
