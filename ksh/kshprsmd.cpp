@@ -8,9 +8,9 @@
 // literal form of the status-history statement, and the situation name in a
 // packed predicate, have their double quotes doubled; values put into the
 // XML of a threshold command are escaped for XML.
-#include <cctype>
 #include <cstdio>
 #include <cstring>
+#include <utility>
 
 #include "kshcat.h"
 #include "kshcol.h"
@@ -347,8 +347,7 @@ int wtoDefaults(MdCtx& m) {
     const char* data = filterValue(r, "data");
     char* command = m.arena.format("message:severity=%s;Category=%s;message=%s", severity ? severity : " ",
                                    category ? category : " ", data ? data : " ");
-    // Two-argument trace format: index and name, then value.
-    return commandFilters(m, command, "New Filter [%d] Name '%s' Value '%s'");
+    return commandFilters(m, command, "WTO Filter [%d] Name '%s' Value '%s'");
 }
 
 // The column of the threshold attribute filter `tag` ("keyname",

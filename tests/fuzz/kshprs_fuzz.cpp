@@ -73,8 +73,12 @@ void checkRecord(const WSQL_Request_t& r) {
 
 WSQL_Hub* fuzzHub() {
     static WSQL_Hub* hub = [] {
+        // The source tree: CSIT_SOURCE_DIR, else the one this file was
+        // compiled from (tests/fuzz/ below it).
         const char* src = getenv("CSIT_SOURCE_DIR");
-        std::string dir = std::string(src ? src : ".") + "/data/attrlib";
+        std::string root = src ? src : __FILE__;
+        if (!src) root = root.substr(0, root.rfind("/tests/fuzz/"));
+        std::string dir = root + "/data/attrlib";
         setenv("CT_ATTRLIB", dir.c_str(), 0);
         RAS1_Configure("NONE", "/dev/null");
         WSQL_GetCatalog();
