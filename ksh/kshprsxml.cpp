@@ -306,7 +306,12 @@ int readColumns(ParseCtx& c) {
         if (rc == WSQL_OK) c.req->attributeForm = 1;
     }
     for (; rc == WSQL_OK && c.req->numColumns < WSQL_MAX_COLUMNS; rc = c.doc->nextNode()) {
-        char* text = valueOf(c.doc->getCurrent());
+        // An empty element names no column. (Names are cleaned in place
+        // later, so a column must point into the document, never at a
+        // static text.)
+        KSH_DOMNode* node = c.doc->getCurrent();
+        if (node == nullptr || node->getValueLength() == 0) continue;
+        char* text = node->getValue();
         if (c.req->attributeForm) {
             if (char* dot = strchr(text, '.')) {
                 *dot = '\0';

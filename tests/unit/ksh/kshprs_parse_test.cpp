@@ -183,6 +183,13 @@ TEST_F(KshPrsParse, CTGetElementsLandInTheRecord) {
     EXPECT_EQ(str(q->req.columns[1]), "Nodot");
     EXPECT_EQ(q->req.type & WSQL_TYPE_ALLTARGETS, 0u);
 
+    // Empty column elements name nothing (and leave no static text to be
+    // cleaned in place later).
+    auto empty = parse("<CT_Get><object>ZAG_DISK</object><attribute></attribute><attribute>Free_MB</attribute>"
+                       "<attribute/></CT_Get>");
+    ASSERT_EQ(empty->req.numColumns, 1);
+    EXPECT_EQ(WSQL_SetupGetMethod(&empty->http, &empty->req), 0);
+
     // Columns are read only for a "start" action.
     auto ins = parse("<CT_Get><action>insert</action><table>T</table><column>A</column></CT_Get>");
     EXPECT_EQ(ins->req.numColumns, 0);
