@@ -42,7 +42,9 @@ constexpr long long kPassMillis = 60 * 1000;
 std::recursive_mutex gListMutex;           // requestListMutex
 LinkedList* gRequestList = nullptr;        // GUARDED_BY(gListMutex) for scans and its life
 WSQL_SignalEvent gTimer;                   // requestListTimer
-std::thread gExpiryThread;                 // requestListThreadID
+// requestListThreadID. Never destroyed: a process that ends without
+// terminate must not meet a joinable thread in a static destructor.
+std::thread& gExpiryThread = *new std::thread;
 std::atomic<int> gExpiry{WSQL_DEFAULT_EXPIRY};
 std::atomic<KFA_ResolveThruNode_t> gResolver{nullptr};
 std::atomic<bool> gRunning{false};
@@ -376,6 +378,9 @@ void WSQL_Request::Exit(long status, void* arg) {
         char d[160];
         r->describe(d, sizeof d);
         std::lock_guard<std::mutex> cg(r->completion.mutex());
+        // A cancel the waiter has not seen yet wins over the open's late
+        // report: the request is no longer persisted and must end.
+        if (r->completion.pendingLocked(WSQL_CANCELLED)) return 0;
         r->completion.signalLocked(static_cast<int>(status));
         RAS1_TRACE_IF(ras, RAS1_STATE, "Signal request status=%d %s", static_cast<int>(status), d);
         return 0;

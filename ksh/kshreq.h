@@ -104,6 +104,8 @@ public:
     // Waits until `deadlineMillis` of BSS1_MonotonicMillis().
     int waitUntil(long long deadlineMillis, int* code);
     bool posted();
+    // REQUIRES: mutex() held. True while a signal of `code` awaits its waiter.
+    bool pendingLocked(int code) const { return signaled != 0 && code_ == code; }
     std::mutex& mutex() { return mu; }
 
 private:
