@@ -7,7 +7,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <thread>
 
 #include "anc1/anc1.h"
 #include "bss1/bss1.h"
@@ -15,6 +14,7 @@
 #include "kshcat.h"
 #include "kshcol.h"
 #include "kshhttp.h"
+#include "kshanchor.h"
 #include "kshhub.h"
 #include "kshtab.h"
 #include "kshutil.h"
@@ -42,9 +42,7 @@ constexpr long long kPassMillis = 60 * 1000;
 std::recursive_mutex gListMutex;           // requestListMutex
 LinkedList* gRequestList = nullptr;        // GUARDED_BY(gListMutex) for scans and its life
 WSQL_SignalEvent gTimer;                   // requestListTimer
-// requestListThreadID. Never destroyed: a process that ends without
-// terminate must not meet a joinable thread in a static destructor.
-std::thread& gExpiryThread = *new std::thread;
+BSS1_Thread* gExpiryThread = nullptr;      // requestListThreadID
 std::atomic<int> gExpiry{WSQL_DEFAULT_EXPIRY};
 std::atomic<KFA_ResolveThruNode_t> gResolver{nullptr};
 std::atomic<bool> gRunning{false};
@@ -153,7 +151,15 @@ int WSQL_Request::initialize() {
             RAS1_TRACE_IF(ras, RAS1_STATE, "Request expiry interval set to %d seconds", expiry);
         }
         gExpiry.store(expiry);
-        gExpiryThread = std::thread(deleteExpiredRequests, gRequestList);
+        // Sized like every thread of the gateway: the anchor's stack size.
+        size_t stack = gAnchor != nullptr ? gAnchor->threadStackSize : 0;
+        int st = BSS1_CreateThread(&gExpiryThread, stack,
+                                   [](void* list) { deleteExpiredRequests(static_cast<LinkedList*>(list)); },
+                                   gRequestList);
+        if (st != 0) {
+            RAS1_Printf(RAS1_THIS, __LINE__, "Unable to start the request expiry thread st=%d", st);
+            gExpiryThread = nullptr;
+        }
         gRunning.store(true);
     }
     // The thru-node resolver: a module of that name when one is installed,
@@ -236,7 +242,8 @@ int WSQL_Request::terminate() {
         return 0;
     }
     gTimer.signal(kTimerExit);
-    if (gExpiryThread.joinable()) gExpiryThread.join();
+    if (gExpiryThread != nullptr) (void)BSS1_JoinThread(gExpiryThread);
+    gExpiryThread = nullptr;
     gTimer.clear();
     bool activeLeft = false;
     {
@@ -314,7 +321,7 @@ int WSQL_Request::terminate() {
 }
 
 int WSQL_Request::expiryPassNow() {
-    if (!gRunning.load()) return WSQL_NOTFOUND;
+    if (!gRunning.load() || gExpiryThread == nullptr) return WSQL_NOTFOUND;
     std::unique_lock<std::mutex> l(gPassMu);
     unsigned target = gPassesStarted + 1;
     gTimer.signal(kTimerScanNow);
