@@ -87,24 +87,40 @@ check() { # url
 check "http://127.0.0.1:$OUR_PORT/soap/file64k.bin"
 check "http://127.0.0.1:$NGINX_PORT/file64k.bin"
 
-rps() { # url
-  wrk -t"$THREADS" -c"$CONNS" -d"${SECONDS_RUN}s" "$1" | awk '/^Requests\/sec:/{print $2}'
+# CPU ticks (user + system) used so far by the given processes.
+ticks() { local t=0 p; for p in "$@"; do t=$((t + $(awk '{print $14 + $15}' "/proc/$p/stat"))); done; echo "$t"; }
+HZ=$(getconf CLK_TCK)
+# One wrk run: prints "requests/s requests cpu-ticks" for the server processes given after the url.
+run() { # url pids...
+  local url=$1; shift
+  local t0 out t1
+  t0=$(ticks "$@")
+  out=$(wrk -t"$THREADS" -c"$CONNS" -d"${SECONDS_RUN}s" "$url")
+  t1=$(ticks "$@")
+  echo "$(echo "$out" | awk '/^Requests\/sec:/{print $2}') $(echo "$out" | awk '/requests in/{print $1}') $((t1 - t0))"
 }
-# Rounds alternate between the two servers and the best of each counts, so
-# that load from other processes on the machine hits both alike.
-OURS=0; THEIRS=0; ALL_OURS=""; ALL_THEIRS=""
+NGINX_PIDS="$NGINX_PID $(pgrep -P "$NGINX_PID" | tr '\n' ' ')"
+# Rounds alternate between the two servers and the best rate of each counts,
+# so that load from other processes on the machine hits both alike; the CPU
+# time the servers spend per request is summed over all rounds (it depends
+# much less on that load).
+OURS=0; THEIRS=0; ALL_OURS=""; ALL_THEIRS=""; RQ_A=0; RQ_B=0; CPU_A=0; CPU_B=0
 for _ in $(seq "$ROUNDS"); do
-  A=$(rps "http://127.0.0.1:$OUR_PORT/soap/file64k.bin")
-  B=$(rps "http://127.0.0.1:$NGINX_PORT/file64k.bin")
+  read -r A NA TA < <(run "http://127.0.0.1:$OUR_PORT/soap/file64k.bin" "$HOST_PID")
+  # shellcheck disable=SC2086
+  read -r B NB TB < <(run "http://127.0.0.1:$NGINX_PORT/file64k.bin" $NGINX_PIDS)
   ALL_OURS="$ALL_OURS $A"; ALL_THEIRS="$ALL_THEIRS $B"
+  RQ_A=$((RQ_A + NA)); RQ_B=$((RQ_B + NB)); CPU_A=$((CPU_A + TA)); CPU_B=$((CPU_B + TB))
   OURS=$(awk -v a="$A" -v b="$OURS" 'BEGIN{print (a>b)?a:b}')
   THEIRS=$(awk -v a="$B" -v b="$THEIRS" 'BEGIN{print (a>b)?a:b}')
 done
 RATIO=$(awk -v a="$OURS" -v b="$THEIRS" 'BEGIN{printf "%.2f", a/b}')
-echo "64 KiB file, wrk -t$THREADS -c$CONNS -d${SECONDS_RUN}s, best of $ROUNDS alternating rounds"
-echo "  file server over kdh1: $OURS requests/s  (rounds:$ALL_OURS)"
-echo "  nginx:                 $THEIRS requests/s  (rounds:$ALL_THEIRS)"
-echo "  ratio:                 $RATIO (goal >= 0.70)"
+US_A=$(awk -v t="$CPU_A" -v n="$RQ_A" -v hz="$HZ" 'BEGIN{printf "%.0f", t * 1e6 / hz / n}')
+US_B=$(awk -v t="$CPU_B" -v n="$RQ_B" -v hz="$HZ" 'BEGIN{printf "%.0f", t * 1e6 / hz / n}')
+echo "64 KiB file, wrk -t$THREADS -c$CONNS -d${SECONDS_RUN}s, best of $ROUNDS alternating rounds (load: $(cut -d' ' -f1 /proc/loadavg))"
+echo "  file server over kdh1: $OURS requests/s  (rounds:$ALL_OURS), server CPU $US_A us/request"
+echo "  nginx:                 $THEIRS requests/s  (rounds:$ALL_THEIRS), server CPU $US_B us/request"
+echo "  ratio:                 $RATIO (goal >= 0.70); CPU-time ratio $(awk -v a="$US_A" -v b="$US_B" 'BEGIN{printf "%.2f", b/a}')"
 
 # 1 GiB: sample the server's resident set while one client downloads it.
 rss_kib() { awk '/^VmRSS:/{print $2}' "/proc/$HOST_PID/status"; }
