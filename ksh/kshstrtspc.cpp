@@ -1,18 +1,22 @@
-// kshstrtspc: set-up of the special requests' layers at gateway start.
-//
-// The special requests (transform, export) keep no process-wide state yet,
-// so there is nothing to prepare for them: both calls do nothing.
+// kshstrtspc: set-up of the special requests' layers at gateway start: the
+// stylesheet transformer and the export layer (its snapshot header file).
+#include "kshexprt.h"
 #include "kshstrt.h"
+#include "kshxslt.h"
 #include "ras1/ras1.h"
 
 RAS1_UNIT("kshstrtspc");
 
 void WSQL_InitTransformLayer() {
     int ras = RAS1_Sync(RAS1_THIS);
-    if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "The transform layer needs no set-up");
+    int rc = WSQL_XSLT::initOnce();
+    if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "Transform layer ready: %d", rc);
 }
 
 void WSQL_InitExportLayer() {
     int ras = RAS1_Sync(RAS1_THIS);
-    if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "The export layer needs no set-up");
+    // A header that cannot be written is traced by initOnce; warehouse
+    // exports then fail on their own.
+    int rc = WSQL_ExportRequest::initOnce();
+    if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "Export layer ready: %d", rc);
 }

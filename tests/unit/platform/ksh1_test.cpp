@@ -16,101 +16,11 @@
 #include <vector>
 
 #include "ksh1/ksh1.h"
+#include "platform/loopback.h"
 
 namespace {
 
-// Answers every request with the configured status and body, keeping
-// connections open (HTTP/1.1), and records what it received.
-class MiniHttp {
-public:
-    explicit MiniHttp(bool silent = false) : silent(silent) {
-        fd = socket(AF_INET, SOCK_STREAM, 0);
-        sockaddr_in a{};
-        a.sin_family = AF_INET;
-        a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        int one = 1;
-        setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
-        bind(fd, reinterpret_cast<sockaddr*>(&a), sizeof a);
-        listen(fd, 8);
-        socklen_t n = sizeof a;
-        getsockname(fd, reinterpret_cast<sockaddr*>(&a), &n);
-        port = ntohs(a.sin_port);
-        acceptor = std::thread([this] { acceptLoop(); });
-    }
-    ~MiniHttp() {
-        stopping = true;
-        shutdown(fd, SHUT_RDWR);
-        close(fd);
-        acceptor.join();
-        std::lock_guard<std::mutex> g(mu);
-        for (int c : conns) shutdown(c, SHUT_RDWR);
-        for (auto& t : workers) t.join();
-        for (int c : conns) close(c);
-    }
-
-    std::string url(const std::string& path = "/soap") const {
-        return "http://127.0.0.1:" + std::to_string(port) + path;
-    }
-    std::vector<std::string> requests() {
-        std::lock_guard<std::mutex> g(mu);
-        return received;
-    }
-    int connections() {
-        std::lock_guard<std::mutex> g(mu);
-        return static_cast<int>(conns.size());
-    }
-
-    int status = 200;
-    std::string body = "<answer/>";
-
-private:
-    void acceptLoop() {
-        while (!stopping) {
-            int c = accept(fd, nullptr, nullptr);
-            if (c < 0) return;
-            std::lock_guard<std::mutex> g(mu);
-            conns.push_back(c);
-            workers.emplace_back([this, c] { serve(c); });
-        }
-    }
-    void serve(int c) {
-        std::string in;
-        char buf[4096];
-        for (;;) {
-            size_t end = in.find("\r\n\r\n");
-            if (end != std::string::npos) {
-                size_t cl = 0;
-                size_t at = in.find("Content-Length: ");
-                if (at != std::string::npos && at < end) cl = std::strtoul(in.c_str() + at + 16, nullptr, 10);
-                if (in.size() >= end + 4 + cl) {
-                    {
-                        std::lock_guard<std::mutex> g(mu);
-                        received.push_back(in.substr(0, end + 4 + cl));
-                    }
-                    in.erase(0, end + 4 + cl);
-                    if (silent) continue;
-                    std::string out = "HTTP/1.1 " + std::to_string(status) + " X\r\nContent-Type: text/xml\r\n" +
-                                      "Content-Length: " + std::to_string(body.size()) + "\r\n\r\n" + body;
-                    if (write(c, out.data(), out.size()) < 0) return;
-                    continue;
-                }
-            }
-            ssize_t n = read(c, buf, sizeof buf);
-            if (n <= 0) return;
-            in.append(buf, static_cast<size_t>(n));
-        }
-    }
-
-    bool silent;
-    int fd = -1;
-    int port = 0;
-    std::atomic<bool> stopping{false};
-    std::thread acceptor;
-    std::mutex mu;
-    std::vector<int> conns;
-    std::vector<std::thread> workers;
-    std::vector<std::string> received;
-};
+using loopback::MiniHttp;
 
 bool contains(const std::string& s, const std::string& part) { return s.find(part) != std::string::npos; }
 
