@@ -227,7 +227,8 @@ int WSQL_KDH_StartServer(WSQL_Hub* hub) {
     int ras = RAS1_Sync(RAS1_THIS);
     RAS1_ENTRY(ras);
     // A fault while serving ends this hub's thread with 8; the clean-up runs
-    // on every way out.
+    // on every way out. (The platform keeps no per-thread error context
+    // beyond this recovery frame.)
     int rc = PFM1_Guard("WSQL_KDH_StartServer", [hub] { return serveHub(hub); });
     if (gAnchor != nullptr && (ras & RAS1_DETAIL))
         RAS1_Printf(RAS1_THIS, __LINE__, "anchor = %p anchor->parm[0] = %s", static_cast<void*>(gAnchor),
