@@ -26,12 +26,6 @@ namespace {
 const char kAttachFailed[] = "\n<error>Unable to attach file</error>\n";
 const char kTransformFailed[] = "<transform>FAILED</transform>";
 
-// The batch steps by the tag of the sub-request (exact comparison).
-struct BatchStep {
-    const char* tag;
-    int (WSQL_MetaRequest::*run)(KSH_XML* fragment);
-};
-
 // The client address without its port, as the SOAP start-up takes it.
 void takeClientHost(WSQL_HttpServer* http, WSQL_Request_t* rec) {
     const char* client = http->getRequestClient();
@@ -42,6 +36,13 @@ void takeClientHost(WSQL_HttpServer* http, WSQL_Request_t* rec) {
 }
 
 }  // namespace
+
+// The steps of a batch by the tag of the sub-request.
+const WSQL_BatchStep WSQL_MetaRequest::kBatchSteps[] = {
+    {"CT_Get", &WSQL_MetaRequest::getRequest},    {"CT_Redirect", &WSQL_MetaRequest::routeStep},
+    {"attach", &WSQL_MetaRequest::attachRequest}, {"insert", &WSQL_MetaRequest::insertRequest},
+    {"execute", &WSQL_MetaRequest::executeStep},
+};
 
 WSQL_MetaRequest::WSQL_MetaRequest(WSQL_Hub* hub, WSQL_HttpServer* http, KSH_XML* document)
     : WSQL_Request(hub, http),
@@ -60,7 +61,9 @@ WSQL_MetaRequest::WSQL_MetaRequest(WSQL_Hub* hub, WSQL_HttpServer* http, KSH_XML
       suffixName(nullptr),
       suffixText(nullptr),
       suffixLength(0),
-      subRequestId(nullptr) {
+      subRequestId(nullptr),
+      batchSteps(kBatchSteps),
+      batchStepCount(sizeof kBatchSteps / sizeof kBatchSteps[0]) {
     memset(&subRequest, 0, sizeof subRequest);
 }
 
@@ -220,11 +223,6 @@ int WSQL_MetaRequest::insertXMLTagTrailer() {
 int WSQL_MetaRequest::retrieveData() {
     int ras = RAS1_Sync(RAS1_THIS);
     RAS1_ENTRY(ras);
-    static const BatchStep kBatch[] = {
-        {"CT_Get", &WSQL_MetaRequest::getRequest},       {"CT_Redirect", &WSQL_MetaRequest::routeStep},
-        {"attach", &WSQL_MetaRequest::attachRequest},    {"insert", &WSQL_MetaRequest::insertRequest},
-        {"execute", &WSQL_MetaRequest::executeStep},
-    };
     unsigned count = 0;
     int more = document->getArray("request", &count);
     while (more == WSQL_OK) {
@@ -241,8 +239,8 @@ int WSQL_MetaRequest::retrieveData() {
         }
         if (ras & RAS1_STATE) RAS1_Printf(RAS1_THIS, __LINE__, "Sub-request \"%s\" id \"%s\"", tag, id ? id : "");
         (void)insertXMLTagHeader();
-        for (const BatchStep& s : kBatch)
-            if (strcmp(tag, s.tag) == 0) (void)(this->*s.run)(fragment);
+        for (size_t i = 0; i < batchStepCount; i++)
+            if (strcmp(tag, batchSteps[i].tag) == 0) (void)(this->*batchSteps[i].run)(fragment);
         (void)insertXMLTagTrailer();
         more = document->nextNode();
     }

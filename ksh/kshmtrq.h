@@ -55,6 +55,15 @@ class KSH_XML;
 class WSQL_Hub;
 class WSQL_HttpServer;
 
+class WSQL_MetaRequest;
+
+// One kind of batch step: the sub-request's tag (exact comparison) and the
+// member that runs it on the fragment holding the sub-request.
+struct WSQL_BatchStep {
+    const char* tag;
+    int (WSQL_MetaRequest::*run)(KSH_XML* fragment);
+};
+
 class WSQL_MetaRequest : public WSQL_Request {
 public:
     // A request of `hub` for `http` reading `document` (not owned).
@@ -103,6 +112,9 @@ public:
     // directory.
     static bool staysInFileDirectory(const char* name);
 
+    // The steps of a batch: CT_Get, CT_Redirect, attach, insert, execute.
+    static const WSQL_BatchStep kBatchSteps[5];
+
     // Read access for tests and the concrete requests.
     const char* getOutputData() const { return outputData; }
     uint32_t getOutputLength() const { return outputLength; }
@@ -110,6 +122,15 @@ public:
     const WSQL_Request_t& getSubRequest() const { return subRequest; }
 
 protected:
+    // Replaces the table of batch steps (`count` entries, a static table
+    // that outlives the request). Requests that only check documents (the
+    // fuzz target) use it to leave out steps that reach the store or the
+    // network.
+    void setBatchSteps(const WSQL_BatchStep* table, size_t count) {
+        batchSteps = table;
+        batchStepCount = count;
+    }
+
     // The batch steps that create child requests.
     int routeStep(KSH_XML* fragment);
     int executeStep(KSH_XML* fragment);
@@ -134,4 +155,6 @@ protected:
     char* suffixText;           // owned (malloc)
     uint32_t suffixLength;
     char* subRequestId;         // in the document, or null
+    const WSQL_BatchStep* batchSteps;  // static table
+    size_t batchStepCount;
 };

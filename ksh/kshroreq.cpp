@@ -65,29 +65,34 @@ int WSQL_RouteRequest::post(const char* endpoint, const char* text, unsigned len
     return st;
 }
 
-int WSQL_RouteRequest::routeRequest() {
-    int ras = RAS1_Sync(RAS1_THIS);
-    RAS1_ENTRY(ras);
+int WSQL_RouteRequest::prepareRoute(char** endpoint, char** text, unsigned* length) {
     WSQL_HttpServer* http = getHttp();
-    char* endpoint = nullptr;
-    if (document->getAttributeList() != WSQL_OK || document->getAttribute("endpoint", &endpoint) != WSQL_OK) {
+    if (document->getAttributeList() != WSQL_OK || document->getAttribute("endpoint", endpoint) != WSQL_OK) {
         http->setRequestError(true, "No endpoint attribute specified for CT_Redirect request.", nullptr, 0);
-        RAS1_EXIT_RC(ras, WSQL_OK);
-        return WSQL_OK;
+        return WSQL_NOTFOUND;
     }
     char* id = nullptr;
     (void)document->getAttribute("id", &id);  // read, not otherwise used
-    char* text = nullptr;
-    unsigned length = 0;
-    KSH_XML* fragment = nullptr;
     if (document->testElementImmediate("SOAP-ENV:Envelope") != WSQL_OK) {
         http->setRequestError(true, "Unable to redirect SOAP request - SOAP-ENV:Envelope element missing.", nullptr, 0);
-    } else if ((fragment = document->createFragment(nullptr)) == nullptr ||
-               fragment->extractDocumentXML(&text, &length) != WSQL_OK) {
-        RAS1_Printf(RAS1_THIS, __LINE__, "Envelope for \"%s\" could not be serialised", endpoint);
-    } else {
-        (void)post(endpoint, text, length);
+        return WSQL_NOTFOUND;
     }
+    // The test moved the current node to the envelope: it goes out whole.
+    KSH_XML* fragment = document->createFragment(nullptr);
+    if (fragment == nullptr || fragment->extractDocumentXML(text, length) != WSQL_OK) {
+        RAS1_Printf(RAS1_THIS, __LINE__, "Envelope for \"%s\" could not be serialised", *endpoint);
+        return WSQL_NOMEM;
+    }
+    return WSQL_OK;
+}
+
+int WSQL_RouteRequest::routeRequest() {
+    int ras = RAS1_Sync(RAS1_THIS);
+    RAS1_ENTRY(ras);
+    char* endpoint = nullptr;
+    char* text = nullptr;
+    unsigned length = 0;
+    if (prepareRoute(&endpoint, &text, &length) == WSQL_OK) (void)post(endpoint, text, length);
     RAS1_EXIT_RC(ras, WSQL_OK);
     return WSQL_OK;
 }

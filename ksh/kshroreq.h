@@ -35,6 +35,13 @@ public:
     // failure is recorded as a client fault.
     int routeRequest();
 
+    // The checks and the serialisation of routeRequest without the post:
+    // 0 with the endpoint (in the document) and the envelope's text (valid
+    // until the next serialisation of the fragment) set, or nonzero when
+    // there is nothing to send (the fault is recorded for a malformed
+    // request).
+    int prepareRoute(char** endpoint, char** text, unsigned* length);
+
     // Envelopes posted so far.
     int32_t getRouteCount() const { return routeCount; }
 

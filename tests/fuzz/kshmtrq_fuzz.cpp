@@ -1,0 +1,156 @@
+// Runs arbitrary bytes, parsed as a request document, through the meta
+// request's steps: common parameters, the batch walk with its "XML ID"
+// wrappers, attach, insert and execute steps (over an empty file directory,
+// so that no file is ever found), CT_Get sub-requests parsed into the
+// sub-request record without running them, CT_Redirect sub-requests
+// checked and serialised without being posted, the suffix and the
+// stylesheet step. Nothing reaches a store or the network.
+//
+// Checks: the output data lies inside the response buffer, every string of
+// the sub-request record is readable, and a document with a stylesheet
+// ends its response with the transform's failure mark.
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+
+#include "kshhttp.h"
+#include "kshhub.h"
+#include "kshmtrq.h"
+#include "kshreq.h"
+#include "kshroreq.h"
+#include "kshssrv.h"
+#include "kshutil.h"
+#include "kshxmlxp.h"
+#include "ras1/ras1.h"
+
+namespace {
+
+class FuzzHttp : public WSQL_HttpServer {
+public:
+    const char* getRequestMethod() override { return "POST"; }
+    const char* getQueryString() override { return ""; }
+    const char* getPathInfo() override { return "/soap"; }
+    const char* getPathTranslated() override { return "/soap"; }
+    const char* getRequestClient() override { return "10.0.0.1:4000"; }
+    int writeHeaders(uint32_t, uint32_t, uint64_t, uint32_t, const KDH1_sendhdr_struct*) override { return 0; }
+    int writeClient(const char*, size_t) override { return 0; }
+    int writeClientUTF8(const char*, size_t) override { return 0; }
+    int readClient(char** data, uint32_t* n) override {
+        *data = nullptr;
+        *n = 0;
+        return 0;
+    }
+};
+
+[[noreturn]] void fail(const char* what) {
+    fprintf(stderr, "meta request check failed: %s\n", what);
+    abort();
+}
+
+size_t touch(const char* s) { return s ? strlen(s) : 0; }
+
+void checkRecord(const WSQL_Request_t& r) {
+    if (r.numParma < 0 || r.numParma > WSQL_MAX_PARMA) fail("parma count");
+    for (int i = 0; i < r.numParma; ++i) {
+        touch(r.parma[i].name);
+        touch(r.parma[i].value);
+    }
+    if (r.numFilters < 0 || r.numFilters > WSQL_MAX_FILTERS) fail("filter count");
+    for (int i = 0; i < r.numFilters; ++i) {
+        touch(r.filters[i].column);
+        touch(r.filters[i].value);
+    }
+    if (r.numColumns < 0 || r.numColumns > WSQL_MAX_COLUMNS) fail("column count");
+    for (int i = 0; i < r.numColumns; ++i) touch(r.columns[i]);
+    for (const char* s : {r.table, r.target, r.sql, r.thrunode, r.requestHandle, r.hubAlias}) touch(s);
+}
+
+// A meta request whose CT_Get and CT_Redirect steps stop short of the store
+// and the network.
+class DryMeta : public WSQL_MetaRequest {
+public:
+    DryMeta(WSQL_Hub* hub, WSQL_HttpServer* http, KSH_XML* doc) : WSQL_MetaRequest(hub, http, doc) {
+        setBatchSteps(kDrySteps, sizeof kDrySteps / sizeof kDrySteps[0]);
+    }
+    int processResults() override { return 0; }
+
+    int dryGet(KSH_XML* fragment) {
+        memset(&subRequest, 0, sizeof subRequest);
+        KSH_XML parsed;
+        int rc = parseGetRequest(fragment, &parsed);
+        checkRecord(subRequest);
+        if (rc == 0) rc = insertRequestData();
+        memset(&subRequest, 0, sizeof subRequest);
+        action = nullptr;
+        return rc;
+    }
+    int dryRoute(KSH_XML* fragment) {
+        WSQL_RouteRequest route(getHub(), getHttp(), fragment);
+        char* endpoint = nullptr;
+        char* text = nullptr;
+        unsigned length = 0;
+        if (route.prepareRoute(&endpoint, &text, &length) != 0) return 0;
+        touch(endpoint);
+        if (strlen(text) != length) fail("serialised envelope length");
+        return 0;
+    }
+
+    bool hasStylesheet() const { return stylesheet != nullptr; }
+
+private:
+    using Step = int (WSQL_MetaRequest::*)(KSH_XML*);
+    static const WSQL_BatchStep kDrySteps[5];
+};
+
+const WSQL_BatchStep DryMeta::kDrySteps[5] = {
+    {"CT_Get", static_cast<Step>(&DryMeta::dryGet)},
+    {"CT_Redirect", static_cast<Step>(&DryMeta::dryRoute)},
+    {"attach", &WSQL_MetaRequest::attachRequest},
+    {"insert", &WSQL_MetaRequest::insertRequest},
+    {"execute", &DryMeta::executeStep},
+};
+
+WSQL_Hub* fuzzHub() {
+    static WSQL_Hub* hub = [] {
+        const char* src = getenv("CSIT_SOURCE_DIR");
+        std::string root = src ? src : __FILE__;
+        if (!src) root = root.substr(0, root.rfind("/tests/fuzz/"));
+        setenv("CT_ATTRLIB", (root + "/data/attrlib").c_str(), 0);
+        RAS1_Configure("NONE", "/dev/null");
+        WSQL_GetCatalog();
+        (void)WSQL_Request::initialize();
+        // An empty file directory of its own: no attach or execute file is
+        // ever found.
+        char tmpl[] = "/tmp/kshmtrq_fuzz.XXXXXX";
+        const char* dir = mkdtemp(tmpl);
+        WSQL_SetFileDirectory(dir != nullptr ? dir : "/nonexistent-kshmtrq-fuzz");
+        auto* h = new WSQL_Hub("FUZZ_NO_STORE", "soap", "soap", nullptr);
+        h->setServerPath("FUZZ_NO_STORE", "HUB_MAIN");
+        return h;
+    }();
+    return hub;
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+    WSQL_Hub* hub = fuzzHub();
+    KSH_XML doc;
+    if (doc.parseMessage(reinterpret_cast<const char*>(data), static_cast<unsigned>(size)) != 0) return 0;
+    FuzzHttp http;
+    DryMeta meta(hub, &http, &doc);
+    (void)meta.processRequest();
+    WSQL_ResponseBuffer* b = http.getBuffer();
+    if (b == nullptr || !b->valid()) return 0;
+    const char* text = b->getBuffer();
+    size_t length = b->getLength();
+    const char* out = meta.getOutputData();
+    if (out != nullptr && (out != text || meta.getOutputLength() > length)) fail("output data outside the buffer");
+    static const char kMark[] = "<transform>FAILED</transform>";
+    const size_t markLength = sizeof kMark - 1;
+    if (meta.hasStylesheet() && (length < markLength || memcmp(text + length - markLength, kMark, markLength) != 0))
+        fail("stylesheet without the failure mark");
+    return 0;
+}
