@@ -82,6 +82,27 @@ TEST_F(GatewayE2E, SoapMethodsGetActionsAndFilesAnswerOverHttp) {
     EXPECT_TRUE(contains(page("soap/sitlist.xsl"), "xsl:stylesheet"));
 }
 
+TEST(GatewayValidationE2E, ValidationDecidesWhetherRequestsNeedCredentials) {
+    TempDir tmp;
+    const std::string select =
+        soap("<CT_SQL><table>O4SRV.TSITDESC</table><sql>SELECT SITNAME FROM O4SRV.TSITDESC WHERE SITNAME = "
+             "\"ZAG_CPU_Busy\"</sql></CT_SQL>");
+    Vemsd strict(tmp.path() / "strict");
+    ASSERT_TRUE(strict.start()) << strict.output();
+    Reply r = http("POST", strict.url(), select);
+    EXPECT_TRUE(contains(r.body, "<SOAP-ENV:Fault>")) << r.body;
+    EXPECT_FALSE(contains(r.body, "ZAG_CPU_Busy")) << r.body;
+    EXPECT_EQ(strict.stop(), 0);
+
+    Vemsd open(tmp.path() / "open", {"--validate", "no", "--store", (tmp.path() / "open.db").string()});
+    ASSERT_TRUE(open.start()) << open.output();
+    r = http("POST", open.url(), select);
+    EXPECT_TRUE(contains(r.body, "<SITNAME>ZAG_CPU_Busy</SITNAME>")) << r.body;
+    EXPECT_TRUE(fs::exists(tmp.path() / "open.db"));
+    EXPECT_FALSE(fs::exists(tmp.path() / "open" / "hub.db"));
+    EXPECT_EQ(open.stop(), 0);
+}
+
 TEST_F(GatewayE2E, AddedAndRemovedHubsRewriteTheHubListFileAndServeAfterARestart) {
     // A second hub with a store of its own and one situation only it has.
     Vemsd east(tmp.path() / "east");
