@@ -512,7 +512,10 @@ int Sql1Store::acquire(Sql1Conn** conn) {
 }
 
 void Sql1Store::release(Sql1Conn* conn) {
-    constexpr size_t kMaxIdle = 8;  // idle connections kept for reuse
+    // Idle connections kept for reuse: as many as the HTTP layer runs requests
+    // at once, so a loaded gateway does not reopen (and re-read the schema of)
+    // a connection for most requests.
+    constexpr size_t kMaxIdle = 64;
     if (conn == nullptr) return;
     {
         std::lock_guard<std::mutex> g(mu_);
