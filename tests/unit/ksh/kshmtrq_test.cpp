@@ -64,6 +64,19 @@ TEST_F(MetaRequest, BatchWritesEveryStepBetweenPrefixAndSuffix) {
     EXPECT_EQ(readAll(html + "/out.xml"), body.substr(0, body.size() - 29));
 }
 
+TEST_F(MetaRequest, OutputStaysValidWhenTheFailureMarkGrowsTheBuffer) {
+    // An output that nearly fills the first response buffer (10239 bytes):
+    // appending the transform's mark moves the buffer, and the exported
+    // output must be read from where it is now.
+    const std::string row = "<p>" + std::string(10223, 'x') + "</p>";
+    ASSERT_EQ(row.size(), 10230u);
+    auto h = post("CT_Export", "<filename>full.xml</filename><stylesheet>s.xsl</stylesheet>"
+                               "<request><insert>" + row + "</insert></request>");
+    EXPECT_EQ(lastRc, 0);
+    EXPECT_EQ(soapBody(*h), row + "<transform>FAILED</transform>");
+    EXPECT_EQ(readAll(html + "/full.xml"), row);
+}
+
 TEST_F(MetaRequest, BatchWithoutRequestsOrPrefixFile) {
     file("post.xml", "</report>");
     auto h = post("CT_Export", "<filename>out.xml</filename><prefix>none.xml</prefix><suffix>post.xml</suffix>");
