@@ -15,6 +15,8 @@
 #include <cstring>
 #include <string>
 
+#include <unistd.h>
+
 #include "kshhttp.h"
 #include "kshhub.h"
 #include "kshmtrq.h"
@@ -120,11 +122,12 @@ WSQL_Hub* fuzzHub() {
         setenv("CT_ATTRLIB", (root + "/data/attrlib").c_str(), 0);
         RAS1_Configure("NONE", "/dev/null");
         WSQL_GetCatalog();
-        (void)WSQL_Request::initialize();
-        // An empty file directory of its own: no attach or execute file is
-        // ever found.
-        char tmpl[] = "/tmp/kshmtrq_fuzz.XXXXXX";
+        // The request list is not started: requests work without it, and
+        // its expiry thread would outlive the fuzzer's exit. An empty file
+        // directory of its own: no attach or execute file is ever found.
+        static char tmpl[] = "/tmp/kshmtrq_fuzz.XXXXXX";
         const char* dir = mkdtemp(tmpl);
+        if (dir != nullptr) atexit([] { rmdir(tmpl); });
         WSQL_SetFileDirectory(dir != nullptr ? dir : "/nonexistent-kshmtrq-fuzz");
         auto* h = new WSQL_Hub("FUZZ_NO_STORE", "soap", "soap", nullptr);
         h->setServerPath("FUZZ_NO_STORE", "HUB_MAIN");
