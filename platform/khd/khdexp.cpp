@@ -40,14 +40,14 @@ bool parseField(const std::string& item, Field* f) {
     size_t open = item.find('(');
     if (open == std::string::npos || item.back() != ')') return false;
     std::string name = item.substr(0, open);
-    std::string spec = item.substr(open + 1, item.size() - open - 2);
+    std::string shape = item.substr(open + 1, item.size() - open - 2);
     size_t dot = name.rfind('.');
     f->column = dot == std::string::npos ? name : name.substr(dot + 1);
     unsigned long off = 0, len = 0;
     char type[8] = {};
     int used = 0;
-    if (sscanf(spec.c_str(), "%7[a-z],%lu,%lu%n", type, &off, &len, &used) != 3 ||
-        static_cast<size_t>(used) != spec.size() || strcmp(type, "char") != 0)
+    if (sscanf(shape.c_str(), "%7[a-z],%lu,%lu%n", type, &off, &len, &used) != 3 ||
+        static_cast<size_t>(used) != shape.size() || strcmp(type, "char") != 0)
         return false;
     f->offset = off;
     f->length = len;
