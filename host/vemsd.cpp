@@ -13,6 +13,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <filesystem>
@@ -143,6 +144,21 @@ int awaitListener(const sigset_t& set, const VemsdOptions& o) {
     return 0;
 }
 
+// The gateway keeps files of its own in the current folder (the export
+// snapshot files): run in the home, so that two servers on one machine never
+// share them. Relative folder settings are made absolute first.
+int enterHome(const std::string& home) {
+    for (const char* name : {"KSH_DIRECTORY", "CT_ATTRLIB", "ATTRLIB", "AFF1_TABLE", "RAS1_LOG"}) {
+        const char* v = getenv(name);
+        if (v && *v && *v != '/') setenv(name, fs::absolute(v).c_str(), 1);
+    }
+    if (chdir(fs::absolute(home).c_str()) != 0) {
+        std::fprintf(stderr, "vemsd: cannot enter %s: %s\n", home.c_str(), std::strerror(errno));
+        return VEMSD_EXIT_FAILED;
+    }
+    return 0;
+}
+
 int run(const VemsdOptions& o) {
     int ras = RAS1_Sync(RAS1_THIS);
     RAS1_ENTRY(ras);
@@ -153,8 +169,9 @@ int run(const VemsdOptions& o) {
     }
     vemsdSetEnvironment(o.home);
     SQL1_SetHome(fs::absolute(o.home).c_str());
-    const std::string storePath = o.store.empty() ? (fs::path(o.home) / "hub.db").string() : o.store;
+    const std::string storePath = fs::absolute(o.store.empty() ? fs::path(o.home) / "hub.db" : fs::path(o.store));
     if (prepareStore(o, storePath) != 0) return VEMSD_EXIT_FAILED;
+    if (enterHome(o.home) != 0) return VEMSD_EXIT_FAILED;
     if (KDH1_SetListenAddress(o.listen.c_str(), o.port) != KDH1_STC_OK) {
         std::fprintf(stderr, "vemsd: cannot listen on %s:%d\n", o.listen.c_str(), o.port);
         return VEMSD_EXIT_FAILED;

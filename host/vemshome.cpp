@@ -34,6 +34,7 @@ struct HomePart {
 const HomePart kParts[] = {
     {"HTML", "HTML", "", true},
     {"attrlib", "attrlib", ".atr", true},
+    {"affinity", "affinity", ".tbl", true},
     {"kshxhubs.xml", "HTML/kshxhubs.xml", "", false},
     {"servers.conf", "servers.conf", "", false},
 };

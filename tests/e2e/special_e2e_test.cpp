@@ -134,11 +134,11 @@ private:
 class SpecialE2E : public ::testing::Test {
 protected:
     void SetUp() override {
-        // The snapshot files go to vemsd's current directory: this test's
-        // temporary folder.
+        // vemsd runs in its home: the snapshot files and the affinity table
+        // copied there are its own, wherever it was started from.
         ASSERT_NE(getcwd(previousDir, sizeof previousDir), nullptr);
         ASSERT_EQ(chdir(tmp.path().c_str()), 0);
-        setenv("AFF1_TABLE", (sourceDir() + "/data/affinity/affinity.tbl").c_str(), 1);
+        unsetenv("AFF1_TABLE");
         hub = std::make_unique<Vemsd>(tmp.path() / "home");
         ASSERT_TRUE(hub->start()) << hub->output();
         html = hub->home() / "HTML";
@@ -311,11 +311,11 @@ TEST_F(SpecialE2E, ExportToADatedFileAndToTheWarehouse) {
              "</big></insert></request></CT_Export>");
     const std::string b = body(r);
     ASSERT_GT(b.size(), 40000u) << b.substr(0, 300);
-    const std::string record = readFile(tmp.path() / "kshsnap");
+    const std::string record = readFile(hub->home() / "kshsnap");
     ASSERT_EQ(record.size(), 32032u);
     EXPECT_EQ(record.substr(0, 16), "sysadmin        ");
     EXPECT_EQ(record.substr(32), b.substr(0, 32000));
-    EXPECT_EQ(readFile(tmp.path() / "kshsnap.hdr").size(), 80u);
+    EXPECT_EQ(readFile(hub->home() / "kshsnap.hdr").size(), 80u);
     auto rows = query(hub->store(), "SELECT USERID, length(WRITETIME), length(XMLDATA), HOSTNAME FROM \"WAREHOUSE.SNAPSHOT\"");
     ASSERT_EQ(rows.size(), 1u);
     // The host name is the hub's node name, which vemsd announces.

@@ -504,7 +504,6 @@ TEST_F(KshPrs, EveryClientRefusalAnswersWithItsFault) {
         {soap("CT_Get", "<hub>elsewhere</hub>" + c), "Invalid Hub Alias."},
         {soap("CT_Login", c), "Invalid or missing CT method in string."},
         {soapEnvelope("<NotAMethod/>"), "Invalid or missing CT method in string."},
-        {soap("CT_Export", c), "Invalid or missing CT method in string."},
         {soap("CT_Alert", name + c), "Invalid or missing source name for CT_Alert."},
         {soap("CT_Reset", name + "<results>r</results>" + c), "Missing timestamp for results in CT status method."},
         {soap("CT_Reset", name + "<results>r</results><timestamp>1</timestamp><data>d</data>" + c),
