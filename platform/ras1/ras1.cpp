@@ -24,7 +24,7 @@ namespace {
 // writer takes writeMutex only, so tracing never waits for a reconfiguration
 // longer than one line.
 std::mutex configMutex;
-std::string traceSpec;   // GUARDED_BY(configMutex)
+std::string traceConfig;   // GUARDED_BY(configMutex)
 bool configured = false;  // GUARDED_BY(configMutex)
 std::mutex writeMutex;
 int logFd = 2;            // GUARDED_BY(writeMutex)
@@ -79,8 +79,8 @@ void openLog(const char* path) {
 void ensureConfigured() {
     std::lock_guard<std::mutex> g(configMutex);
     if (configured) return;
-    const char* spec = getenv("RAS1_TRACE");
-    traceSpec = spec ? spec : "";
+    const char* config = getenv("RAS1_TRACE");
+    traceConfig = config ? config : "";
     openLog(getenv("RAS1_LOG"));
     configured = true;
 }
@@ -111,10 +111,10 @@ void writeLine(const char* unit, int line, const char* text, size_t textLen) {
 
 }  // namespace
 
-int RAS1_LevelFor(const char* spec, const char* unitName) {
+int RAS1_LevelFor(const char* config, const char* unitName) {
     int level = RAS1_ERROR;
     size_t bestLen = 0;
-    std::string all = spec ? spec : "";
+    std::string all = config ? config : "";
     size_t pos = 0;
     while (pos <= all.size()) {
         size_t comma = all.find(',', pos);
@@ -145,17 +145,17 @@ int RAS1_Refresh(RAS1_Unit& unit) {
     {
         std::lock_guard<std::mutex> g(configMutex);
         gen = RAS1_generation.load(std::memory_order_relaxed);
-        level = RAS1_LevelFor(traceSpec.c_str(), unit.name);
+        level = RAS1_LevelFor(traceConfig.c_str(), unit.name);
     }
     unit.level.store(level, std::memory_order_relaxed);
     unit.generation.store(gen, std::memory_order_release);
     return level;
 }
 
-void RAS1_Configure(const char* spec, const char* logPath) {
+void RAS1_Configure(const char* config, const char* logPath) {
     std::lock_guard<std::mutex> g(configMutex);
-    const char* s = spec ? spec : getenv("RAS1_TRACE");
-    traceSpec = s ? s : "";
+    const char* s = config ? config : getenv("RAS1_TRACE");
+    traceConfig = s ? s : "";
     openLog(logPath ? logPath : getenv("RAS1_LOG"));
     configured = true;
     RAS1_generation.fetch_add(1, std::memory_order_release);

@@ -81,11 +81,11 @@ void RAS1_Dump(RAS1_Unit& unit, int line, const void* data, size_t length);
 
 // Replaces the configuration (null arguments: read RAS1_TRACE / RAS1_LOG
 // again). Every unit picks the change up on its next RAS1_Sync.
-void RAS1_Configure(const char* traceSpec, const char* logPath);
+void RAS1_Configure(const char* traceConfig, const char* logPath);
 
 // Level that a configuration string gives to a unit name (used by
 // RAS1_Refresh and by tests of the configuration grammar).
-int RAS1_LevelFor(const char* traceSpec, const char* unitName);
+int RAS1_LevelFor(const char* traceConfig, const char* unitName);
 
 // Entry/exit tracing for the common function shape:
 //   int ras = RAS1_Sync(RAS1_THIS); RAS1_ENTRY(ras); ... RAS1_EXIT_RC(ras, rc); return rc;
