@@ -64,19 +64,13 @@ int baseByFullName(void* ctx, char* msgBuf, char** respSlot) {
         kuiReplace(basesitShortName, shortName);
         return 0;
     }
-    if (rc == KUIR_SERVER) {
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the base situation exists as full name on "
-                             "the server");
-        errCode = KUIE_SERVER;
-    } else if (rc == KUIR_COMM) {
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the base situation "
-                             "exists as full name in the server");
-        errCode = KUIE_COMM;
-    } else if (rc == KUIR_INTERNAL) {
-        KUI_TRACE_ERROR(ras, "Internal error occurred while checking whether the base situation exists as full name in "
-                             "the server");
-        errCode = KUIE_INTERNAL;
-    } else {
+    if (!KUI_QUERY_FAILED(ras, rc,
+                          "Server exception occurred while checking whether the base situation exists as full name on "
+                          "the server",
+                          "Communication error occurred, SOAP query failed while checking whether the base situation "
+                          "exists as full name in the server",
+                          "Internal error occurred while checking whether the base situation exists as full name in "
+                          "the server")) {
         rc = KUIR_ABSENT;
         KUI_TRACE_ERROR(ras, "Base situation name specified does not exist [%s]:", kuiText(baseSitName));
         errCode = KUIE_NOSUCHBASE;
@@ -93,14 +87,13 @@ int baseExists(void* ctx, char* msgBuf, char** respSlot) {
         errCode = KUIE_NOSUCHBASE;
     } else if (rc == KUIR_ABSENT) {
         rc = baseByFullName(ctx, msgBuf, respSlot);
-    } else if (rc == KUIR_SERVER) {
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the base situation already exist on the "
-                             "server");
-        errCode = KUIE_SERVER;
-    } else if (rc == KUIR_COMM) {
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the base situation "
-                             "already exist in the server");
-        errCode = KUIE_COMM;
+    } else if (rc == KUIR_SERVER || rc == KUIR_COMM) {
+        KUI_QUERY_FAILED(ras, rc,
+                         "Server exception occurred while checking whether the base situation already exist on the "
+                         "server",
+                         "Communication error occurred, SOAP query failed while checking whether the base situation "
+                         "already exist in the server",
+                         nullptr);
     } else {
         KUI_TRACE_DETAIL(ras, "Base situation name specified exists [%s] :", kuiText(basesitShortName));
         if (rc != 0) errCode = KUIE_INTERNAL;
@@ -118,19 +111,13 @@ int longNameFree(void* ctx, char* msgBuf, char** respSlot) {
         KUI_TRACE_ERROR(ras, "Long name specified already exists [%s] :", kuiText(longSitName));
         return KUIR_TAKEN;
     }
-    if (rc == KUIR_SERVER) {
-        errCode = KUIE_SERVER;
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the situation long name already exist on "
-                             "the server");
-    } else if (rc == KUIR_COMM) {
-        errCode = KUIE_COMM;
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the situation long "
-                             "name already exist in the server");
-    } else if (rc == KUIR_INTERNAL) {
-        errCode = KUIE_INTERNAL;
-        KUI_TRACE_ERROR(ras, "Internal error occurred while checking whether the situation long name already exist in "
-                             "the server");
-    } else {
+    if (!KUI_QUERY_FAILED(ras, rc,
+                          "Server exception occurred while checking whether the situation long name already exist on "
+                          "the server",
+                          "Communication error occurred, SOAP query failed while checking whether the situation long "
+                          "name already exist in the server",
+                          "Internal error occurred while checking whether the situation long name already exist in "
+                          "the server")) {
         rc = 0;
         KUI_TRACE_DETAIL(ras, "Long name specified does not exist [%s], hence proceed to creation process :",
                          kuiText(longSitName));
@@ -146,16 +133,11 @@ int oldServerNameFree(void* ctx, char* msgBuf, char** respSlot) {
                          kuiText(sitName));
         return 0;
     }
-    if (rc == KUIR_SERVER) {
-        errCode = KUIE_SERVER;
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the situation already exist on the server");
-    } else if (rc == KUIR_COMM) {
-        errCode = KUIE_COMM;
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the situation "
-                             "already exist in the server");
-    } else if (rc == KUIR_INTERNAL) {
-        errCode = KUIE_INTERNAL;
-    } else {
+    if (!KUI_QUERY_FAILED(ras, rc,
+                          "Server exception occurred while checking whether the situation already exist on the server",
+                          "Communication error occurred, SOAP query failed while checking whether the situation "
+                          "already exist in the server",
+                          nullptr)) {
         rc = KUIR_TAKEN;
         errCode = KUIE_EXISTS;
         KUI_TRACE_ERROR(ras, "situation name specified already exists [%s] :", kuiText(sitName));

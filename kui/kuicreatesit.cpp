@@ -113,17 +113,12 @@ int runSteps(int argc, char** argv, char* msgBuf, char** respSlot, void* ctx) {
     if (rc == 0) rc = checkArguments(argc, argv, ctx);
     if (rc == 0) {
         rc = getVemsVersion(ctx, msgBuf, respSlot, &vemsVersion);
-        if (rc == KUIR_SERVER) {
-            errCode = KUIE_SERVER;
-            KUI_TRACE_ERROR(ras, "Server exception occurred while retrieving the VEMS version from the server");
-        } else if (rc == KUIR_COMM) {
-            errCode = KUIE_COMM;
-            KUI_TRACE_ERROR(ras,
-                        "Communication error occurred, SOAP query failed while retrieving the VEMS version from the server");
-        } else if (rc != 0) {
-            errCode = KUIE_INTERNAL;
-            KUI_TRACE_ERROR(ras, "Internal error occurred while retrieving the VEMS version from the server");
-        }
+        // Any other failure of the version query counts as an internal error
+        // (the run still ends with the query's own result).
+        const int kind = (rc == 0 || rc == KUIR_SERVER || rc == KUIR_COMM) ? rc : KUIR_INTERNAL;
+        KUI_QUERY_FAILED(ras, kind, "Server exception occurred while retrieving the VEMS version from the server",
+                         "Communication error occurred, SOAP query failed while retrieving the VEMS version from the server",
+                         "Internal error occurred while retrieving the VEMS version from the server");
     }
     if (rc == 0) KUI_TRACE_DETAIL(ras, "VEMS version is [%s] :", kuiText(vemsVersion));
     if (rc == 0 && sitFilePresent == 1) rc = createFromXMLFile(ctx, msgBuf, respSlot);
@@ -150,6 +145,18 @@ void kuiReplace(char*& p, const char* s) {
     char* c = kuiDup(s);
     delete[] p;
     p = c;
+}
+
+bool kuiQueryFailed(RAS1_Unit& unit, int line, int ras, int rc, const KuiQueryTexts& texts) {
+    const char* text;
+    switch (rc) {
+        case KUIR_SERVER: errCode = KUIE_SERVER; text = texts.server; break;
+        case KUIR_COMM: errCode = KUIE_COMM; text = texts.comm; break;
+        case KUIR_INTERNAL: errCode = KUIE_INTERNAL; text = texts.internal; break;
+        default: return false;
+    }
+    if (text && (ras & RAS1_ERROR)) RAS1_Printf(unit, line, "%s", text);
+    return true;
 }
 
 bool kuiOldServer() { return !vemsVersion || strncmp(vemsVersion, kOldVersion, 5) < 0; }

@@ -291,19 +291,13 @@ int checkLongName(void* ctx, char* msgBuf, char** respSlot) {
         KUI_TRACE_ERROR(ras, "Long name specified in the XML already exists [%s] :", kuiText(longSitName));
         return KUIR_TAKEN;
     }
-    if (rc == KUIR_SERVER) {
-        errCode = KUIE_SERVER;
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the long situation name already exist on "
-                             "the server");
-    } else if (rc == KUIR_COMM) {
-        errCode = KUIE_COMM;
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the long situation "
-                             "name already exist in the server");
-    } else if (rc == KUIR_INTERNAL) {
-        errCode = KUIE_INTERNAL;
-        KUI_TRACE_ERROR(ras, "Internal error occurred while checking whether the long situation name already exist in "
-                             "the server");
-    } else {
+    if (!KUI_QUERY_FAILED(ras, rc,
+                          "Server exception occurred while checking whether the long situation name already exist on "
+                          "the server",
+                          "Communication error occurred, SOAP query failed while checking whether the long situation "
+                          "name already exist in the server",
+                          "Internal error occurred while checking whether the long situation name already exist in "
+                          "the server")) {
         KUI_TRACE_DETAIL(ras, "Long name specified in the XML does not exist [%s], hence proceed to creation process :",
                          kuiText(longSitName));
         rc = 0;
@@ -321,22 +315,14 @@ int checkShortName(void* ctx, char* msgBuf, char** respSlot) {
                          kuiText(sitName));
         return 0;
     }
-    if (rc == KUIR_SERVER) {
-        errCode = KUIE_SERVER;
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the situation name already exist on the "
-                             "server");
+    // An internal failure of the look-up itself: the name is not known to be taken.
+    if (KUI_QUERY_FAILED(ras, rc,
+                         "Server exception occurred while checking whether the situation name already exist on the "
+                         "server",
+                         "Communication error occurred, SOAP query failed while checking whether the situation name "
+                         "already exist in the server",
+                         nullptr))
         return rc;
-    }
-    if (rc == KUIR_COMM) {
-        errCode = KUIE_COMM;
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the situation name "
-                             "already exist in the server");
-        return rc;
-    }
-    if (rc == KUIR_INTERNAL) {  // the look-up itself failed: the name is not known to be taken
-        errCode = KUIE_INTERNAL;
-        return rc;
-    }
     if (longNameExist) {
         KUI_TRACE_DETAIL(ras, "situation name specified in the XML already exists [%s]. Generate another one:",
                          kuiText(sitName));

@@ -98,16 +98,16 @@ int insertintoTSITDESC(void* ctx, char* msgBuf, char**) {
     st.add(")").add("]]>");
     KUI_TRACE_DETAIL(ras, "SOAP request for inserting situation definition is [%s] ", st.text());
     int rc = kuiSendUpdate(ctx, st);
-    noteFailure(rc);
     if (rc == KUIR_OK) {
         sitInserted = 1;
         KUI_TRACE_DETAIL(ras, "Situation [%s] successfully inserted into TSITDESC", kuiText(sitName));
-    } else if (rc == KUIR_SERVER) {
-        KUI_TRACE_ERROR(ras, "Server exception occurred, SOAP query failed during insertion of situation details into "
-                             "TSITDESC table in the server");
-    } else if (rc == KUIR_COMM) {
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed during insertion of situation details "
-                             "into TSITDESC table in the server");
+    } else if (rc == KUIR_SERVER || rc == KUIR_COMM) {
+        KUI_QUERY_FAILED(ras, rc,
+                         "Server exception occurred, SOAP query failed during insertion of situation details into "
+                         "TSITDESC table in the server",
+                         "Communication error occurred, SOAP query failed during insertion of situation details "
+                         "into TSITDESC table in the server",
+                         nullptr);
     }
     RAS1_EXIT_RC(ras, rc);
     return rc;
@@ -171,15 +171,15 @@ int insertintoTNAME(void* ctx, char* msgBuf, char**) {
     st.add(KUI_QIBUSER).add("\", \"").add("2012").add("\"").add(")").add("]]>");
     KUI_TRACE_DETAIL(ras, "SOAP request for inserting situation fullname into TNAME table is [%s] ", st.text());
     int rc = kuiSendUpdate(ctx, st);
-    noteFailure(rc);
     if (rc == KUIR_OK)
         KUI_TRACE_DETAIL(ras, "Situation [%s] successfully inserted into TNAME", kuiText(sitName));
-    else if (rc == KUIR_SERVER)
-        KUI_TRACE_ERROR(ras, "Server exception occurred, SOAP query failed during insertion of situation details into "
-                             "TNAME table in the server");
-    else if (rc == KUIR_COMM)
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed during insertion of situation details "
-                             "into TNAME table in the server");
+    else if (rc == KUIR_SERVER || rc == KUIR_COMM)
+        KUI_QUERY_FAILED(ras, rc,
+                         "Server exception occurred, SOAP query failed during insertion of situation details into "
+                         "TNAME table in the server",
+                         "Communication error occurred, SOAP query failed during insertion of situation details "
+                         "into TNAME table in the server",
+                         nullptr);
     delete[] fullName;
     delete[] shortName;
     RAS1_EXIT_RC(ras, rc);

@@ -129,19 +129,13 @@ int determineShortname(void* ctx, char* msgBuf, char** respSlot) {
         if (rc == 0 && shortName[0]) {
             kuiReplace(basesitShortName, shortName);
             KUI_TRACE_DETAIL(ras, "Short name for baseSitName [%s] :", basesitShortName);
-        } else if (rc == KUIR_SERVER) {
-            errCode = KUIE_SERVER;
-            KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the base situation name already "
-                                 "exist on the server");
-        } else if (rc == KUIR_COMM) {
-            errCode = KUIE_COMM;
-            KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the base "
-                                 "situation name already exist in the server");
-        } else if (rc == KUIR_INTERNAL) {
-            errCode = KUIE_INTERNAL;
-            KUI_TRACE_ERROR(ras, "Internal error occurred while checking whether the base situation name already exist "
-                                 "in the server");
-        } else {
+        } else if (!KUI_QUERY_FAILED(ras, rc,
+                                     "Server exception occurred while checking whether the base situation name already "
+                                     "exist on the server",
+                                     "Communication error occurred, SOAP query failed while checking whether the base "
+                                     "situation name already exist in the server",
+                                     "Internal error occurred while checking whether the base situation name already "
+                                     "exist in the server")) {
             rc = KUIR_ABSENT;
             errCode = KUIE_NOSUCHBASE;
             KUI_TRACE_ERROR(ras, "Base situation [%s] specified does not exist on the server", kuiText(baseSitName));
@@ -213,19 +207,13 @@ int checkShortNameValidity(void* ctx, char* msgBuf, char** respSlot, const char*
     if (rc == 0 && found[0]) {
         rc = KUIR_TAKEN;
         KUI_TRACE_DETAIL(ras, "[%s] already exists as a Full name. Hence it cannot be a shortname :", name);
-    } else if (rc == KUIR_SERVER) {
-        errCode = KUIE_SERVER;
-        KUI_TRACE_ERROR(ras, "Server exception occurred while checking whether the name exists as full name in TNAME "
-                             "table");
-    } else if (rc == KUIR_COMM) {
-        errCode = KUIE_COMM;
-        KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed while checking whether the name exists as "
-                             "full name in TNAME table");
-    } else if (rc == KUIR_INTERNAL) {
-        errCode = KUIE_INTERNAL;
-        KUI_TRACE_ERROR(ras, "Internal error occurred while while checking whether the name exists as full name in "
-                             "TNAME table");
-    } else {
+    } else if (!KUI_QUERY_FAILED(ras, rc,
+                                 "Server exception occurred while checking whether the name exists as full name in "
+                                 "TNAME table",
+                                 "Communication error occurred, SOAP query failed while checking whether the name "
+                                 "exists as full name in TNAME table",
+                                 "Internal error occurred while while checking whether the name exists as full name in "
+                                 "TNAME table")) {
         rc = 0;
         KUI_TRACE_DETAIL(ras, "Name specified does not exist in TNAME [%s] table", name);
     }
@@ -237,14 +225,12 @@ int checkShortNameValidity(void* ctx, char* msgBuf, char** respSlot, const char*
         } else if (rc == KUIR_ABSENT) {
             rc = 0;
             KUI_TRACE_DETAIL(ras, "Name [%s] is unique. Can be used as short name", name);
-        } else if (rc == KUIR_SERVER) {
-            errCode = KUIE_SERVER;
-            KUI_TRACE_ERROR(ras, "Server Exception error occurred while checking the sitname already exist in the server");
-        } else if (rc == KUIR_COMM) {
-            errCode = KUIE_COMM;
-            KUI_TRACE_ERROR(ras, "Communication error occurred while checking the sitname already exist in the server");
         } else {
-            errCode = KUIE_INTERNAL;
+            // Any other failure of the look-up counts as an internal error.
+            KUI_QUERY_FAILED(ras, (rc == KUIR_SERVER || rc == KUIR_COMM) ? rc : KUIR_INTERNAL,
+                             "Server Exception error occurred while checking the sitname already exist in the server",
+                             "Communication error occurred while checking the sitname already exist in the server",
+                             nullptr);
         }
     }
     RAS1_EXIT_RC(ras, rc);

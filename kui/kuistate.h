@@ -15,6 +15,8 @@
 
 #include <string>
 
+#include "ras1/ras1.h"
+
 // Capacity of the two property arrays.
 enum : int { MAX_PROPERTY_NUM = 7 };
 
@@ -140,6 +142,19 @@ void kuiReplace(char*& p, const char* s);
 inline const char* kuiText(const char* s) { return s ? s : ""; }
 // True when the server is older than 06.21 (first 5 characters of vemsVersion).
 bool kuiOldServer();
+
+// The trace texts of one server query's failures (null: that failure is
+// not traced).
+struct KuiQueryTexts {
+    const char* server;    // server exception (7)
+    const char* comm;      // communication error (4)
+    const char* internal;  // internal error (8)
+};
+// When `rc` is one of the support library's failures 7, 4 or 8, sets errCode
+// to 97, 14 or 99, traces the matching text under `unit` and returns true;
+// otherwise changes nothing and returns false.
+bool kuiQueryFailed(RAS1_Unit& unit, int line, int ras, int rc, const KuiQueryTexts& texts);
+#define KUI_QUERY_FAILED(ras, rc, ...) kuiQueryFailed(RAS1_THIS, __LINE__, (ras), (rc), KuiQueryTexts{__VA_ARGS__})
 
 // Releases the owned state (the end of every run).
 void deallocation();

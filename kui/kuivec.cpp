@@ -105,14 +105,13 @@ int insertVECDetails(void* ctx, char* msgBuf, char**) {
         if (rc == KUIR_OK) {
             KUI_TRACE_DETAIL(ras, "VEC SLOT details successfully inserted into EVNTMAP for situation : [%s]",
                              kuiText(sitName));
-        } else if (rc == KUIR_COMM) {
-            errCode = KUIE_COMM;
-            KUI_TRACE_ERROR(ras, "Communication error occurred, SOAP query failed during insertion of VEC SLOT details "
-                                 "in to EVNTMAP");
-        } else if (rc == KUIR_SERVER) {
-            errCode = KUIE_SERVER;
-            KUI_TRACE_ERROR(ras, "Server exception occurred, SOAP query failed during insertion of VEC SLOT details in "
-                                 "to EVNTMAP");
+        } else if (rc == KUIR_COMM || rc == KUIR_SERVER) {
+            KUI_QUERY_FAILED(ras, rc,
+                             "Server exception occurred, SOAP query failed during insertion of VEC SLOT details in "
+                             "to EVNTMAP",
+                             "Communication error occurred, SOAP query failed during insertion of VEC SLOT details "
+                             "in to EVNTMAP",
+                             nullptr);
         }
     }
     RAS1_EXIT_RC(ras, rc);
