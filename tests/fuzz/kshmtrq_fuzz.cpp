@@ -17,6 +17,7 @@
 
 #include <unistd.h>
 
+#include "fuzzcommon.h"
 #include "kshhttp.h"
 #include "kshhub.h"
 #include "kshmtrq.h"
@@ -29,45 +30,10 @@
 
 namespace {
 
-class FuzzHttp : public WSQL_HttpServer {
-public:
-    const char* getRequestMethod() override { return "POST"; }
-    const char* getQueryString() override { return ""; }
-    const char* getPathInfo() override { return "/soap"; }
-    const char* getPathTranslated() override { return "/soap"; }
-    const char* getRequestClient() override { return "10.0.0.1:4000"; }
-    int writeHeaders(uint32_t, uint32_t, uint64_t, uint32_t, const KDH1_sendhdr_struct*) override { return 0; }
-    int writeClient(const char*, size_t) override { return 0; }
-    int writeClientUTF8(const char*, size_t) override { return 0; }
-    int readClient(char** data, uint32_t* n) override {
-        *data = nullptr;
-        *n = 0;
-        return 0;
-    }
-};
-
-[[noreturn]] void fail(const char* what) {
-    fprintf(stderr, "meta request check failed: %s\n", what);
-    abort();
-}
-
-size_t touch(const char* s) { return s ? strlen(s) : 0; }
-
-void checkRecord(const WSQL_Request_t& r) {
-    if (r.numParma < 0 || r.numParma > WSQL_MAX_PARMA) fail("parma count");
-    for (int i = 0; i < r.numParma; ++i) {
-        touch(r.parma[i].name);
-        touch(r.parma[i].value);
-    }
-    if (r.numFilters < 0 || r.numFilters > WSQL_MAX_FILTERS) fail("filter count");
-    for (int i = 0; i < r.numFilters; ++i) {
-        touch(r.filters[i].column);
-        touch(r.filters[i].value);
-    }
-    if (r.numColumns < 0 || r.numColumns > WSQL_MAX_COLUMNS) fail("column count");
-    for (int i = 0; i < r.numColumns; ++i) touch(r.columns[i]);
-    for (const char* s : {r.table, r.target, r.sql, r.thrunode, r.requestHandle, r.hubAlias}) touch(s);
-}
+using fuzzcommon::checkRecord;
+using fuzzcommon::FuzzHttp;
+using fuzzcommon::fail;
+using fuzzcommon::touch;
 
 // A meta request whose CT_Get and CT_Redirect steps stop short of the store
 // and the network.

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <string>
 
+#include "fuzzcommon.h"
 #include "kshhttp.h"
 #include "kshhub.h"
 #include "kshprs.h"
@@ -18,58 +19,10 @@
 
 namespace {
 
-class FuzzHttp : public WSQL_HttpServer {
-public:
-    const char* getRequestMethod() override { return "POST"; }
-    const char* getQueryString() override { return ""; }
-    const char* getPathInfo() override { return "/soap"; }
-    const char* getPathTranslated() override { return "/soap"; }
-    const char* getRequestClient() override { return "10.0.0.1:4000"; }
-    int writeHeaders(uint32_t, uint32_t, uint64_t, uint32_t, const KDH1_sendhdr_struct*) override { return 0; }
-    int writeClient(const char*, size_t) override { return 0; }
-    int writeClientUTF8(const char*, size_t) override { return 0; }
-    int readClient(char** data, uint32_t* n) override {
-        *data = nullptr;
-        *n = 0;
-        return 0;
-    }
-};
-
-[[noreturn]] void fail(const char* what) {
-    fprintf(stderr, "record check failed: %s\n", what);
-    abort();
-}
-
-// Reads the whole string (ASan reports a string that is not terminated
-// inside its allocation).
-size_t touch(const char* s) { return s ? strlen(s) : 0; }
-
-void checkFilters(const WSQL_Filter_t* f, int n, int max) {
-    if (n < 0 || n > max) fail("filter count");
-    for (int i = 0; i < n; ++i) {
-        if (f[i].column == nullptr || f[i].value == nullptr) fail("filter without column or value");
-        touch(f[i].column);
-        touch(f[i].oper);
-        touch(f[i].value);
-    }
-}
-
-void checkRecord(const WSQL_Request_t& r) {
-    if (r.numParma < 0 || r.numParma > WSQL_MAX_PARMA) fail("parma count");
-    for (int i = 0; i < r.numParma; ++i) {
-        touch(r.parma[i].name);
-        touch(r.parma[i].value);
-    }
-    checkFilters(r.filters, r.numFilters, WSQL_MAX_FILTERS);
-    checkFilters(r.dataItems, r.numDataItems, WSQL_MAX_DATAITEMS);
-    if (r.numColumns < 0 || r.numColumns > WSQL_MAX_COLUMNS) fail("column count");
-    if (r.numValues < 0 || r.numValues > WSQL_MAX_COLUMNS) fail("value count");
-    for (int i = 0; i < r.numColumns; ++i) touch(r.columns[i]);
-    for (int i = 0; i < r.numValues; ++i) touch(r.values[i]);
-    for (const char* s : {r.table, r.target, r.sql, r.thrunode, r.subSql, r.requestHandle, r.hubAlias,
-                          r.statusSitName, r.expire})
-        touch(s);
-}
+using fuzzcommon::checkRecord;
+using fuzzcommon::FuzzHttp;
+using fuzzcommon::fail;
+using fuzzcommon::touch;
 
 WSQL_Hub* fuzzHub() {
     static WSQL_Hub* hub = [] {
